@@ -1,0 +1,22 @@
+// Factories of the individual routes, called by the route registry (Routes.cpp).
+#pragma once
+#include <memory>
+#include <string>
+
+#include <korvo/platform/Routes.h>
+
+namespace korvo {
+namespace platform {
+
+std::unique_ptr<CaptureRoute> makeNullCaptureRoute();
+std::unique_ptr<OutputRoute> makeNullOutputRoute();
+std::unique_ptr<CaptureRoute> makeWavCaptureRoute(const std::string& path, std::string* error);
+std::unique_ptr<OutputRoute> makeWavOutputRoute(const std::string& path, std::string* error);
+std::unique_ptr<CaptureRoute> makeSimCaptureRoute(const std::string& room, std::string* error);
+std::unique_ptr<OutputRoute> makeSimOutputRoute(const std::string& room, std::string* error);
+// device: empty for the default device, else a device index or a part of its name.
+std::unique_ptr<CaptureRoute> makeCardCaptureRoute(const std::string& device, std::string* error);
+std::unique_ptr<OutputRoute> makeCardOutputRoute(const std::string& device, std::string* error);
+
+}  // namespace platform
+}  // namespace korvo
