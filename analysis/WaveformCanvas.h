@@ -47,6 +47,8 @@ public:
     int32_t rwFlag;
 
 private:
+    friend struct WaveformCanvasTestAccess;  // lets tests run single turns of the loop
+
     bool threadLoop() override;
 };
 

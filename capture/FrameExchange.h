@@ -34,6 +34,10 @@ extern KORVO_EXPORT android::sp<android::WaveformCanvas> WF_Thread;
 extern KORVO_EXPORT pthread_mutex_t DataRW;
 extern KORVO_EXPORT pthread_mutex_t EventRW;
 
+// The shared record and the event word (not exported; reached through the functions below).
+extern Mmic_data_t MDATA;
+extern int32_t audio_event;
+
 // Direction 1 writes the caller's record into the shared one; any other value reads it.
 KORVO_EXPORT int read_write_audio(int* unused, int direction, Mmic_data_t* record);
 // Direction 1 stores *value into the event word; any other value loads it.
@@ -46,4 +50,6 @@ namespace korvo {
 double levelOf(const short* samples, int n);
 // The shared record under DataRW, with its first-use initialisation; used by the capture loop.
 void publishFrame(int32_t index, float level, const int16_t* ring, int32_t count);
+// Tests only: forgets the first use of the record and the event word, as at load.
+void resetSharedRecordForTests();
 }  // namespace korvo

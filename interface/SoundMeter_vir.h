@@ -6,7 +6,7 @@
 
 #include "Export.h"
 
-class KORVO_EXPORT SoundMeter_vir {
+class SoundMeter_vir {
 public:
     SoundMeter_vir();           // writes "Created" to standard output
     virtual ~SoundMeter_vir();  // writes "deleted" to standard output

@@ -71,8 +71,9 @@ public:
     int32_t frameSamples;
     int64_t sleep;
     int16_t pcmRing[2560];
-    int32_t ringIndex;
-    int32_t frameFill;
+    // Reset by stopRecord, possibly on another thread while a capture step runs: relaxed atomics.
+    std::atomic<int32_t> ringIndex;
+    std::atomic<int32_t> frameFill;
     int32_t prepareCountdown;
     int32_t count;
     int32_t need_ack;

@@ -1,0 +1,48 @@
+#include "host/Environment.h"
+
+#include <cstdlib>
+
+#include <korvo/platform/Log.h>
+#include <korvo/platform/Routes.h>
+
+namespace korvo {
+namespace host {
+namespace {
+
+bool applyRoute(const char* variable, const std::string& option, std::string* error) {
+    if (!option.empty()) setenv(variable, option.c_str(), 1);
+    const char* text = getenv(variable);
+    if (text == nullptr || *text == '\0') return true;  // the platform's default route
+    std::string why;
+    if (!korvo::platform::validateRoute(text, &why)) {
+        if (error) *error = std::string(variable) + ": " + why;
+        return false;
+    }
+    return true;
+}
+
+void applyLog(int verbose) {
+    if (verbose > 0) {
+        setenv("KORVO_LOG", "stderr", 1);
+        setenv("KORVO_LOG_LEVEL", verbose > 1 ? "V" : "D", 1);
+    } else {
+        // Silent terminal without -v; a log file the user asked for is still written.
+        const char* target = getenv("KORVO_LOG");
+        bool toFile = target != nullptr && *target != '\0' && std::string(target) != "stderr" &&
+                      std::string(target) != "off";
+        if (!toFile) setenv("KORVO_LOG", "off", 1);
+    }
+    korvo::platform::reloadLogConfig();
+}
+
+}  // namespace
+
+bool applyEnvironment(const CommonOptions& common, std::string* error) {
+    if (!applyRoute("KORVO_MIC", common.mic, error)) return false;
+    if (!applyRoute("KORVO_SPEAKER", common.speaker, error)) return false;
+    applyLog(common.verbose);
+    return true;
+}
+
+}  // namespace host
+}  // namespace korvo

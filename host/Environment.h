@@ -1,0 +1,17 @@
+// The plug-in and the platform stand-in read their settings from the environment;
+// the host sets it before it loads the plug-in.
+#pragma once
+#include <string>
+
+#include "host/Options.h"
+
+namespace korvo {
+namespace host {
+
+// Sets KORVO_MIC, KORVO_SPEAKER and the platform log variables from the options,
+// and checks the routes that the environment already names. False with a
+// one-line reason when a route text is not valid.
+bool applyEnvironment(const CommonOptions& common, std::string* error);
+
+}  // namespace host
+}  // namespace korvo

@@ -1,0 +1,129 @@
+#include "host/Output.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdarg>
+#include <cstring>
+
+namespace korvo {
+namespace host {
+namespace {
+
+FILE* gOut = nullptr;
+
+FILE* hostOut() { return gOut ? gOut : stdout; }
+
+}  // namespace
+
+void initHostOutput() {
+    // Library printf goes through the same stdio stream as everything else in the
+    // process; line buffering makes its lines reach the pipe as they are printed.
+    setvbuf(stdout, nullptr, _IOLBF, 0);
+    int fd = fcntl(STDOUT_FILENO, F_DUPFD_CLOEXEC, 3);
+    if (fd < 0) return;  // no standard output at all: write to stdout, which fails quietly
+    gOut = fdopen(fd, "w");
+    if (gOut == nullptr) {
+        close(fd);
+        return;
+    }
+    setvbuf(gOut, nullptr, _IOLBF, 0);
+}
+
+void outf(const char* fmt, ...) {
+    va_list ap;
+    va_start(ap, fmt);
+    vfprintf(hostOut(), fmt, ap);
+    va_end(ap);
+    fflush(hostOut());
+}
+
+void errf(const char* fmt, ...) {
+    char line[1024];
+    va_list ap;
+    va_start(ap, fmt);
+    vsnprintf(line, sizeof line, fmt, ap);
+    va_end(ap);
+    // One line, whatever the message carried.
+    for (char* p = line; *p; ++p) {
+        if (*p == '\n' || *p == '\r') *p = ' ';
+    }
+    fprintf(stderr, "soundmeter: %s\n", line);
+    fflush(stderr);
+}
+
+LibraryStdout::~LibraryStdout() { stop(); }
+
+bool LibraryStdout::start(LineHandler handler, std::string* error) {
+    if (mActive) return true;
+    int fds[2];
+    if (pipe2(fds, O_CLOEXEC) != 0) {
+        if (error) *error = std::string("cannot make a pipe: ") + strerror(errno);
+        return false;
+    }
+    fflush(stdout);
+    mSavedFd = fcntl(STDOUT_FILENO, F_DUPFD_CLOEXEC, 3);
+    if (mSavedFd < 0 || dup2(fds[1], STDOUT_FILENO) < 0) {
+        if (error) *error = std::string("cannot redirect standard output: ") + strerror(errno);
+        if (mSavedFd >= 0) close(mSavedFd);
+        mSavedFd = -1;
+        close(fds[0]);
+        close(fds[1]);
+        return false;
+    }
+    close(fds[1]);  // descriptor 1 is now the only write end: restoring it ends the reader
+    mHandler = std::move(handler);
+    mActive = true;
+    mReader = std::thread([this, fd = fds[0]] { readLoop(fd); });
+    return true;
+}
+
+void LibraryStdout::stop() {
+    if (!mActive) return;
+    mActive = false;
+    fflush(stdout);
+    dup2(mSavedFd, STDOUT_FILENO);
+    close(mSavedFd);
+    mSavedFd = -1;
+    if (mReader.joinable()) mReader.join();
+}
+
+void LibraryStdout::readLoop(int fd) {
+    std::string pending;
+    char buf[4096];
+    for (;;) {
+        ssize_t n = read(fd, buf, sizeof buf);
+        if (n < 0 && errno == EINTR) continue;
+        if (n <= 0) break;
+        pending.append(buf, static_cast<size_t>(n));
+        size_t start = 0;
+        for (size_t nl; (nl = pending.find('\n', start)) != std::string::npos; start = nl + 1) {
+            deliver(pending.substr(start, nl - start));
+        }
+        pending.erase(0, start);
+    }
+    // "deleted" comes without a line end: deliver the unterminated rest too.
+    if (!pending.empty()) deliver(pending);
+    close(fd);
+}
+
+void LibraryStdout::deliver(const std::string& line) {
+    if (!mHandler) return;
+    // The library's "Created" has no line end and sticks to the next line it prints.
+    static const std::string kCreated = "Created";
+    if (line.size() > kCreated.size() && line.compare(0, kCreated.size(), kCreated) == 0) {
+        mHandler(kCreated);
+        mHandler(line.substr(kCreated.size()));
+        return;
+    }
+    mHandler(line);
+}
+
+LibraryStdout::LineHandler libraryLinesToStderr(bool verbose) {
+    if (!verbose) return [](const std::string&) {};
+    return [](const std::string& line) { fprintf(stderr, "plug-in stdout: %s\n", line.c_str()); };
+}
+
+}  // namespace host
+}  // namespace korvo

@@ -1,0 +1,63 @@
+// The meter object: construction, destruction and the small accessors.
+#include "meter/SoundMeter.h"
+
+#include <log/log.h>
+
+#include "capture/CaptureStream.h"
+
+namespace {
+const char* const kTag = "TQX";
+const char* const kWho = "SoundMeter";
+}  // namespace
+
+SoundMeter::SoundMeter()
+    : sampleRate(44100),
+      bufferSize(0),
+      frameSamples(512),
+      sleep(0),
+      ringIndex(0),
+      frameFill(0),
+      prepareCountdown(200),
+      count(0),
+      need_ack(0),
+      last_said(-1),
+      last_heard(-1),
+      listener_state(0),
+      speaker_state(0),
+      recordState(0),
+      fillAtRead(0),
+      frameRemaining(0),
+      role(0),
+      audioRecord(nullptr),
+      toneGenerator(nullptr),
+      recordFrameCount(0) {
+    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] SoundMeter start!", kWho);
+    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] audio_is_input_channel succeeded", kWho);
+    // 16 = mono input, 2 = 16-bit PCM. A failed query (-1) leaves -2 here; startRecord copes with it.
+    bufferSize = 2 * AudioRecord_getMinBufferSize(sampleRate, 16, 2);
+    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] bufferSize=%d", kWho, bufferSize);
+    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] nbChannels=0x%x, bytesPerSample=0x%x", kWho, 1, 2);
+    // Frame period in whole milliseconds, in single precision: 1000 / 86.1328125 = 11.6 → 11.
+    sleep = static_cast<int64_t>(1000.0f / (static_cast<float>(sampleRate) / static_cast<float>(frameSamples)));
+    recordFrameCount = bufferSize / 2;
+    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] AudioRecord Set succeeded. sleep set to %ld", kWho,
+                        static_cast<long>(sleep));
+    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] AudioRecord Set succeeded. sleep set to %ld\n", kWho,
+                        static_cast<long>(sleep));
+    ringIndex.store(0, std::memory_order_relaxed);
+    frameFill.store(0, std::memory_order_relaxed);
+}
+
+SoundMeter::~SoundMeter() {
+    end_wf_thread();
+    // The capture stream goes with its last reference; the tone generator is the host's to release.
+    audioRecord.clear();
+}
+
+void SoundMeter::setNeedAck(bool on) { need_ack = on ? 1 : 0; }
+
+void SoundMeter::setRole(int mask) { role = mask; }
+
+int SoundMeter::getRole() { return role; }
+
+int SoundMeter::getCount() { return count; }

@@ -1,0 +1,170 @@
+// Microphone capture stream on the process's capture route, or on the test script.
+#include <media/AudioRecord.h>
+
+#include <atomic>
+#include <cstdint>
+#include <mutex>
+#include <string>
+
+#include <korvo/platform/Routes.h>
+#include <log/log.h>
+
+#include "TestHooks.h"
+
+namespace android {
+
+namespace {
+
+constexpr const char* kTag = "AudioRecord";
+constexpr uint32_t kDefaultSampleRate = 44100;
+
+uint32_t channelCountOf(audio_channel_mask_t mask) {
+    if (mask & AUDIO_CHANNEL_INDEX_HDR) return static_cast<uint32_t>(__builtin_popcount(mask & ~AUDIO_CHANNEL_INDEX_HDR));
+    return static_cast<uint32_t>(__builtin_popcount(mask));
+}
+
+size_t bytesPerSampleOf(audio_format_t format) {
+    switch (format) {
+        case AUDIO_FORMAT_PCM_16_BIT: return 2;
+        case AUDIO_FORMAT_PCM_32_BIT:
+        case AUDIO_FORMAT_PCM_8_24_BIT:
+        case AUDIO_FORMAT_PCM_FLOAT: return 4;
+        default: return 1;
+    }
+}
+
+}  // namespace
+
+struct AudioRecord::Impl {
+    std::mutex stateLock;  // start and stop
+    std::mutex readLock;   // held by a read; start waits for it, so a route never reopens mid-read
+    std::unique_ptr<korvo::platform::CaptureRoute> route;
+    status_t status = NO_INIT;
+    bool configured = false;
+    uint32_t sampleRate = 0;
+    audio_format_t format = AUDIO_FORMAT_DEFAULT;
+    audio_channel_mask_t channelMask = AUDIO_CHANNEL_NONE;
+    size_t frameCount = 0;
+    callback_t callback = nullptr;  // kept only: a synchronous stream has no events to report
+    void* user = nullptr;
+    // True while not started; a read that sees it returns, and stop() sets it to end a read.
+    std::atomic<bool> stopped{true};
+};
+
+status_t AudioRecord::getMinFrameCount(size_t* frameCount, uint32_t /*sampleRate*/,
+                                       audio_format_t /*format*/, audio_channel_mask_t /*channelMask*/) {
+    if (!frameCount) return BAD_VALUE;
+    return korvo::platform::detail::minFrameCount(frameCount);
+}
+
+AudioRecord::AudioRecord(const String16& /*opPackageName*/) : mImpl(std::make_unique<Impl>()) {}
+
+AudioRecord::~AudioRecord() { stop(); }
+
+status_t AudioRecord::set(audio_source_t /*inputSource*/, uint32_t sampleRate, audio_format_t format,
+                          audio_channel_mask_t channelMask, size_t frameCount, callback_t cbf,
+                          void* user, uint32_t /*notificationFrames*/, bool /*threadCanCallJava*/,
+                          audio_session_t /*sessionId*/, transfer_type /*transferType*/,
+                          audio_input_flags_t /*flags*/, int /*uid*/, pid_t /*pid*/,
+                          const audio_attributes_t* /*pAttributes*/) {
+    Impl& d = *mImpl;
+    if (d.configured) {
+        __android_log_print(ANDROID_LOG_ERROR, kTag, "set() called twice");
+        return INVALID_OPERATION;
+    }
+    d.configured = true;
+    if (format == AUDIO_FORMAT_DEFAULT) format = AUDIO_FORMAT_PCM_16_BIT;
+    if (channelMask == AUDIO_CHANNEL_NONE) channelMask = AUDIO_CHANNEL_IN_MONO;
+    d.sampleRate = sampleRate ? sampleRate : kDefaultSampleRate;
+    d.format = format;
+    d.channelMask = channelMask;
+    d.callback = cbf;
+    d.user = user;
+    if (frameCount == 0) {
+        const status_t st = getMinFrameCount(&frameCount, d.sampleRate, format, channelMask);
+        if (st != OK) {
+            __android_log_print(ANDROID_LOG_ERROR, kTag, "no minimum frame count: status %d", st);
+            d.status = st;
+            return st;
+        }
+    }
+    d.frameCount = frameCount;
+
+    // The routes deliver 16-bit mono samples only.
+    if (format != AUDIO_FORMAT_PCM_16_BIT || channelCountOf(channelMask) != 1) {
+        __android_log_print(ANDROID_LOG_ERROR, kTag,
+                            "unsupported format %#x / channel mask %#x (16-bit mono only)",
+                            static_cast<unsigned>(format), static_cast<unsigned>(channelMask));
+        d.status = BAD_VALUE;
+        return BAD_VALUE;
+    }
+
+    const std::string routeText = korvo::platform::micRoute();
+    std::string error;
+    d.route = korvo::platform::makeCaptureRoute(routeText, &error);
+    if (!d.route) {
+        __android_log_print(ANDROID_LOG_ERROR, kTag, "capture route: %s", error.c_str());
+        d.status = NO_INIT;
+        return NO_INIT;
+    }
+    d.status = OK;
+    return OK;
+}
+
+status_t AudioRecord::initCheck() const { return mImpl->status; }
+
+status_t AudioRecord::start(AudioSystem::sync_event_t /*event*/, audio_session_t /*triggerSession*/) {
+    Impl& d = *mImpl;
+    std::lock_guard<std::mutex> state(d.stateLock);
+    if (d.status != OK) return d.status;
+    if (!d.stopped.load(std::memory_order_acquire)) return OK;  // already capturing
+    // A read that saw the stream running is being interrupted; let it leave the route first.
+    std::lock_guard<std::mutex> reading(d.readLock);
+    const int rc = d.route->open(d.sampleRate);
+    if (rc < 0) {
+        __android_log_print(ANDROID_LOG_ERROR, kTag, "capture route did not open: status %d", rc);
+        return rc;
+    }
+    d.stopped.store(false, std::memory_order_release);
+    return OK;
+}
+
+void AudioRecord::stop() {
+    Impl& d = *mImpl;
+    std::lock_guard<std::mutex> state(d.stateLock);
+    if (d.stopped.exchange(true, std::memory_order_acq_rel)) return;
+    if (d.route) d.route->stop();
+    korvo::platform::detail::wakeMicReaders();
+}
+
+bool AudioRecord::stopped() const { return mImpl->stopped.load(std::memory_order_acquire); }
+
+ssize_t AudioRecord::read(void* buffer, size_t size, bool blocking) {
+    Impl& d = *mImpl;
+    if (d.status != OK) return NO_INIT;
+    // The library reads synchronously only; a non-blocking read has nothing to offer here.
+    if (!blocking) return INVALID_OPERATION;
+    if (!buffer || reinterpret_cast<uintptr_t>(buffer) % alignof(int16_t) != 0) return BAD_VALUE;
+    korvo::platform::detail::noteMicRead(size);
+
+    std::lock_guard<std::mutex> reading(d.readLock);
+    if (d.stopped.load(std::memory_order_acquire)) return 0;
+    auto* out = static_cast<int16_t*>(buffer);
+    if (korvo::platform::detail::micScriptOn()) {
+        return korvo::platform::detail::scriptedMicRead(out, size, d.stopped);
+    }
+    const ssize_t n = d.route->read(out, size / sizeof(int16_t));
+    return n < 0 ? n : n * static_cast<ssize_t>(sizeof(int16_t));
+}
+
+size_t AudioRecord::frameCount() const { return mImpl->frameCount; }
+
+size_t AudioRecord::frameSize() const {
+    const Impl& d = *mImpl;
+    if (!d.configured) return 0;
+    return channelCountOf(d.channelMask) * bytesPerSampleOf(d.format);
+}
+
+uint32_t AudioRecord::getSampleRate() const { return mImpl->sampleRate; }
+
+}  // namespace android

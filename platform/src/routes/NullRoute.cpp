@@ -1,0 +1,56 @@
+// The null route: silence from the microphone, discarded output, both at real-time pace.
+#include <cstring>
+
+#include <utils/Errors.h>
+
+#include "routes/Pacer.h"
+#include "routes/RouteFactories.h"
+
+namespace korvo {
+namespace platform {
+
+namespace {
+
+class NullCaptureRoute : public CaptureRoute {
+public:
+    int open(uint32_t sampleRate) override {
+        if (sampleRate == 0) return android::BAD_VALUE;
+        mPacing.start(sampleRate);
+        mOpened = true;
+        return 0;
+    }
+    ssize_t read(int16_t* out, size_t count) override {
+        if (!mOpened) return android::NO_INIT;
+        const size_t n = mPacing.next(count);
+        std::memset(out, 0, n * sizeof(int16_t));
+        return static_cast<ssize_t>(n);
+    }
+    void stop() override { mPacing.stop(); }
+
+private:
+    CapturePacing mPacing;
+    bool mOpened = false;
+};
+
+class NullOutputRoute : public OutputRoute {
+public:
+    int open(uint32_t sampleRate) override {
+        if (sampleRate == 0) return android::BAD_VALUE;
+        mPacing.start(sampleRate);
+        return 0;
+    }
+    void write(const int16_t* /*samples*/, size_t count) override { mPacing.next(count); }
+    void stop() override { mPacing.stop(); }
+
+private:
+    OutputPacing mPacing;
+};
+
+}  // namespace
+
+std::unique_ptr<CaptureRoute> makeNullCaptureRoute() { return std::make_unique<NullCaptureRoute>(); }
+
+std::unique_ptr<OutputRoute> makeNullOutputRoute() { return std::make_unique<NullOutputRoute>(); }
+
+}  // namespace platform
+}  // namespace korvo

@@ -1,0 +1,55 @@
+// A route's place in a room: the mapped shared memory, its member entry and,
+// for a speaker, its slot.
+//
+// Rooms are POSIX shared-memory objects, one per user and room name, mode 0600.
+// Joining and leaving take flock() on the object: the kernel drops that lock
+// when a process dies, so a crash never wedges a room. Under the lock a joiner
+// checks that the name still refers to the object it opened (a leaver may have
+// unlinked it meanwhile), sets the room up if it is new, forgets members whose
+// process is gone and takes free entries; the last leaver unlinks the room.
+// Joining also unlinks rooms of this user that every member has left or died
+// in. Audio itself never takes the lock (see SimRoomSlot.h).
+#pragma once
+#include <cstdint>
+#include <memory>
+#include <string>
+
+#include "routes/SimRoomLayout.h"
+
+namespace korvo {
+namespace platform {
+namespace sim {
+
+class RoomMembership {
+public:
+    enum class Role { Microphone, Speaker };
+
+    // Null with a one-line reason when the room cannot be joined.
+    static std::unique_ptr<RoomMembership> join(const std::string& room, Role role,
+                                                std::string* error);
+    ~RoomMembership();  // leaves the room
+
+    RoomMembership(const RoomMembership&) = delete;
+    RoomMembership& operator=(const RoomMembership&) = delete;
+
+    RoomLayout& layout() { return *mLayout; }
+    // The speaker's own slot (speakers only).
+    SpeakerSlot& slot() { return mLayout->slots[mSlot]; }
+
+private:
+    RoomMembership() = default;
+
+    std::string mObjectName;
+    int mFd = -1;
+    RoomLayout* mLayout = nullptr;
+    int mMember = -1;
+    int mSlot = -1;
+};
+
+// Identity of a running process: its pid and start time, so that a recycled pid
+// does not pass for the member that died. 0 when the process is gone or a zombie.
+uint64_t processIdentity(int pid);
+
+}  // namespace sim
+}  // namespace platform
+}  // namespace korvo
