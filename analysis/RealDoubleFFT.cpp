@@ -4,9 +4,11 @@
 
 #include <cmath>
 
-// Mixed-radix real forward transform. The radix passes keep the classic column-major
-// index arithmetic (1-based helpers below) so that each line can be checked against
-// its derivation; every table read goes through the guarded read of its table.
+// Mixed-radix real forward transform; every table read goes through the guarded read of
+// its table. The radix-3, radix-5 and general passes keep the classic column-major index
+// arithmetic (1-based helpers) so that each line can be checked against its derivation;
+// the radix-2 and radix-4 passes, which carry the 512-point transform, use 0-based
+// offsets and read each entry once into a local.
 
 namespace {
 
@@ -20,38 +22,47 @@ Reader from(const WaveTable_Double& t, int off) {
 }
 
 // cc is (ido, l1, 2), ch is (ido, 2, l1).
-void radf2(int ido, int l1, Reader cc, double* ch, Reader wa1) {
-    auto CC = [&](int i, int k, int j) { return cc[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
-    auto CH = [&](int i, int j, int k) -> double& { return ch[(i - 1) + ido * ((j - 1) + 2 * (k - 1))]; };
-    for (int k = 1; k <= l1; ++k) {
-        CH(1, 1, k) = CC(1, k, 1) + CC(1, k, 2);
-        CH(ido, 2, k) = CC(1, k, 1) - CC(1, k, 2);
+[[gnu::always_inline]] inline void radf2Body(int ido, int l1, Reader cc, double* ch, Reader wa1) {
+    const int s = l1 * ido;  // distance between the two inputs
+    for (int k = 0; k < l1; ++k) {
+        const int a0 = k * ido, a1 = a0 + s;
+        const int h0 = 2 * ido * k, h1 = h0 + ido;
+        const double x0 = cc[a0], x1 = cc[a1];
+        ch[h0] = x0 + x1;
+        ch[h1 + ido - 1] = x0 - x1;
     }
     if (ido < 2) return;
     if (ido > 2) {
-        const int idp2 = ido + 2;
-        for (int k = 1; k <= l1; ++k) {
-            for (int i = 3; i <= ido; i += 2) {
-                const int ic = idp2 - i;
-                const double w1r = wa1[i - 3], w1i = wa1[i - 2];
-                const double tr2 = w1r * CC(i - 1, k, 2) + w1i * CC(i, k, 2);
-                const double ti2 = w1r * CC(i, k, 2) - w1i * CC(i - 1, k, 2);
-                CH(i, 1, k) = CC(i, k, 1) + ti2;
-                CH(ic, 2, k) = ti2 - CC(i, k, 1);
-                CH(i - 1, 1, k) = CC(i - 1, k, 1) + tr2;
-                CH(ic - 1, 2, k) = CC(i - 1, k, 1) - tr2;
+        for (int k = 0; k < l1; ++k) {
+            const int a0 = k * ido, a1 = a0 + s;
+            const int h0 = 2 * ido * k, h1 = h0 + ido;
+            for (int p = 1; p < ido - 1; p += 2) {
+                const int pc = ido - p - 2;  // mirrored position in the second half
+                const double wr = wa1[p - 1], wi = wa1[p];
+                const double re = cc[a1 + p], im = cc[a1 + p + 1];
+                const double xr = cc[a0 + p], xi = cc[a0 + p + 1];
+                const double tr2 = wr * re + wi * im;
+                const double ti2 = wr * im - wi * re;
+                ch[h0 + p + 1] = xi + ti2;
+                ch[h1 + pc + 1] = ti2 - xi;
+                ch[h0 + p] = xr + tr2;
+                ch[h1 + pc] = xr - tr2;
             }
         }
         if (ido % 2 == 1) return;
     }
-    for (int k = 1; k <= l1; ++k) {
-        CH(1, 2, k) = -CC(ido, k, 2);
-        CH(ido, 1, k) = CC(ido, k, 1);
+    for (int k = 0; k < l1; ++k) {
+        const int a0 = k * ido, a1 = a0 + s;
+        const int h0 = 2 * ido * k, h1 = h0 + ido;
+        const double y0 = cc[a0 + ido - 1], y1 = cc[a1 + ido - 1];
+        ch[h1] = -y1;
+        ch[h0 + ido - 1] = y0;
     }
 }
 
 // cc is (ido, l1, 3), ch is (ido, 3, l1).
-void radf3(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2) {
+[[gnu::always_inline]] inline void radf3Body(int ido, int l1, Reader cc, double* ch, Reader wa1,
+                                           Reader wa2) {
     constexpr double taur = -0.5;
     constexpr double taui = 0.866025403784439;
     auto CC = [&](int i, int k, int j) { return cc[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
@@ -88,63 +99,78 @@ void radf3(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2) {
 }
 
 // cc is (ido, l1, 4), ch is (ido, 4, l1).
-void radf4(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2, Reader wa3) {
+[[gnu::always_inline]] inline void radf4Body(int ido, int l1, Reader cc, double* ch, Reader wa1,
+                                           Reader wa2, Reader wa3) {
     constexpr double hsqt2 = 0.7071067811865475;
-    auto CC = [&](int i, int k, int j) { return cc[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
-    auto CH = [&](int i, int j, int k) -> double& { return ch[(i - 1) + ido * ((j - 1) + 4 * (k - 1))]; };
-    for (int k = 1; k <= l1; ++k) {
-        const double tr1 = CC(1, k, 2) + CC(1, k, 4);
-        const double tr2 = CC(1, k, 1) + CC(1, k, 3);
-        CH(1, 1, k) = tr1 + tr2;
-        CH(ido, 4, k) = tr2 - tr1;
-        CH(ido, 2, k) = CC(1, k, 1) - CC(1, k, 3);
-        CH(1, 3, k) = CC(1, k, 4) - CC(1, k, 2);
+    const int s = l1 * ido;  // distance between the four inputs
+    for (int k = 0; k < l1; ++k) {
+        const int a0 = k * ido, a1 = a0 + s, a2 = a1 + s, a3 = a2 + s;
+        const int h0 = 4 * ido * k, h1 = h0 + ido, h2 = h1 + ido, h3 = h2 + ido;
+        const double x0 = cc[a0], x1 = cc[a1], x2 = cc[a2], x3 = cc[a3];
+        const double tr1 = x1 + x3;
+        const double tr2 = x0 + x2;
+        ch[h0] = tr1 + tr2;
+        ch[h3 + ido - 1] = tr2 - tr1;
+        ch[h1 + ido - 1] = x0 - x2;
+        ch[h2] = x3 - x1;
     }
     if (ido < 2) return;
     if (ido > 2) {
-        const int idp2 = ido + 2;
-        for (int k = 1; k <= l1; ++k) {
-            for (int i = 3; i <= ido; i += 2) {
-                const int ic = idp2 - i;
-                const double cr2 = wa1[i - 3] * CC(i - 1, k, 2) + wa1[i - 2] * CC(i, k, 2);
-                const double ci2 = wa1[i - 3] * CC(i, k, 2) - wa1[i - 2] * CC(i - 1, k, 2);
-                const double cr3 = wa2[i - 3] * CC(i - 1, k, 3) + wa2[i - 2] * CC(i, k, 3);
-                const double ci3 = wa2[i - 3] * CC(i, k, 3) - wa2[i - 2] * CC(i - 1, k, 3);
-                const double cr4 = wa3[i - 3] * CC(i - 1, k, 4) + wa3[i - 2] * CC(i, k, 4);
-                const double ci4 = wa3[i - 3] * CC(i, k, 4) - wa3[i - 2] * CC(i - 1, k, 4);
+        for (int k = 0; k < l1; ++k) {
+            const int a0 = k * ido, a1 = a0 + s, a2 = a1 + s, a3 = a2 + s;
+            const int h0 = 4 * ido * k, h1 = h0 + ido, h2 = h1 + ido, h3 = h2 + ido;
+            for (int p = 1; p < ido - 1; p += 2) {
+                const int pc = ido - p - 2;  // mirrored position in the second half
+                const double w1r = wa1[p - 1], w1i = wa1[p];
+                const double w2r = wa2[p - 1], w2i = wa2[p];
+                const double w3r = wa3[p - 1], w3i = wa3[p];
+                const double x0r = cc[a0 + p], x0i = cc[a0 + p + 1];
+                const double x1r = cc[a1 + p], x1i = cc[a1 + p + 1];
+                const double x2r = cc[a2 + p], x2i = cc[a2 + p + 1];
+                const double x3r = cc[a3 + p], x3i = cc[a3 + p + 1];
+                const double cr2 = w1r * x1r + w1i * x1i;
+                const double ci2 = w1r * x1i - w1i * x1r;
+                const double cr3 = w2r * x2r + w2i * x2i;
+                const double ci3 = w2r * x2i - w2i * x2r;
+                const double cr4 = w3r * x3r + w3i * x3i;
+                const double ci4 = w3r * x3i - w3i * x3r;
                 const double tr1 = cr2 + cr4;
                 const double tr4 = cr4 - cr2;
                 const double ti1 = ci2 + ci4;
                 const double ti4 = ci2 - ci4;
-                const double ti2 = CC(i, k, 1) + ci3;
-                const double ti3 = CC(i, k, 1) - ci3;
-                const double tr2 = CC(i - 1, k, 1) + cr3;
-                const double tr3 = CC(i - 1, k, 1) - cr3;
-                CH(i - 1, 1, k) = tr1 + tr2;
-                CH(ic - 1, 4, k) = tr2 - tr1;
-                CH(i, 1, k) = ti1 + ti2;
-                CH(ic, 4, k) = ti1 - ti2;
-                CH(i - 1, 3, k) = ti4 + tr3;
-                CH(ic - 1, 2, k) = tr3 - ti4;
-                CH(i, 3, k) = tr4 + ti3;
-                CH(ic, 2, k) = tr4 - ti3;
+                const double ti2 = x0i + ci3;
+                const double ti3 = x0i - ci3;
+                const double tr2 = x0r + cr3;
+                const double tr3 = x0r - cr3;
+                ch[h0 + p] = tr1 + tr2;
+                ch[h3 + pc] = tr2 - tr1;
+                ch[h0 + p + 1] = ti1 + ti2;
+                ch[h3 + pc + 1] = ti1 - ti2;
+                ch[h2 + p] = ti4 + tr3;
+                ch[h1 + pc] = tr3 - ti4;
+                ch[h2 + p + 1] = tr4 + ti3;
+                ch[h1 + pc + 1] = tr4 - ti3;
             }
         }
         if (ido % 2 == 1) return;
     }
-    for (int k = 1; k <= l1; ++k) {
-        const double ti1 = -hsqt2 * (CC(ido, k, 2) + CC(ido, k, 4));
-        const double tr1 = hsqt2 * (CC(ido, k, 2) - CC(ido, k, 4));
-        CH(ido, 1, k) = tr1 + CC(ido, k, 1);
-        CH(ido, 3, k) = CC(ido, k, 1) - tr1;
-        CH(1, 2, k) = ti1 - CC(ido, k, 3);
-        CH(1, 4, k) = ti1 + CC(ido, k, 3);
+    for (int k = 0; k < l1; ++k) {
+        const int a0 = k * ido, a1 = a0 + s, a2 = a1 + s, a3 = a2 + s;
+        const int h0 = 4 * ido * k, h1 = h0 + ido, h2 = h1 + ido, h3 = h2 + ido;
+        const int e = ido - 1;
+        const double y0 = cc[a0 + e], y1 = cc[a1 + e], y2 = cc[a2 + e], y3 = cc[a3 + e];
+        const double ti1 = -hsqt2 * (y1 + y3);
+        const double tr1 = hsqt2 * (y1 - y3);
+        ch[h0 + e] = tr1 + y0;
+        ch[h2 + e] = y0 - tr1;
+        ch[h1] = ti1 - y2;
+        ch[h3] = ti1 + y2;
     }
 }
 
 // cc is (ido, l1, 5), ch is (ido, 5, l1).
-void radf5(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2, Reader wa3,
-           Reader wa4) {
+[[gnu::always_inline]] inline void radf5Body(int ido, int l1, Reader cc, double* ch, Reader wa1,
+                                           Reader wa2, Reader wa3, Reader wa4) {
     constexpr double tr11 = 0.309016994374947;
     constexpr double ti11 = 0.951056516295154;
     constexpr double tr12 = -0.809016994374947;
@@ -208,12 +234,8 @@ void radf5(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2, Reade
 // General odd factor ip. The main table c is seen as cc (ido, ip, l1), c1 (ido, l1, ip)
 // and c2 (idl1, ip); the second table h as ch (ido, l1, ip) and ch2 (idl1, ip). The input
 // is read from h when ido is 1 and from c otherwise; the result is left in c.
-void radfg(int ido, int ip, int l1, int idl1, WaveTable_Double& c, WaveTable_Double& h,
-           Reader wa) {
-    const Reader cr = from(c, 0);
-    const Reader hr = from(h, 0);
-    double* const cw = c.data;
-    double* const hw = h.data;
+[[gnu::always_inline]] inline void radfgBody(int ido, int ip, int l1, int idl1, Reader cr,
+                                             double* cw, Reader hr, double* hw, Reader wa) {
     auto CCw = [&](int i, int j, int k) -> double& { return cw[(i - 1) + ido * ((j - 1) + ip * (k - 1))]; };
     auto C1 = [&](int i, int k, int j) { return cr[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
     auto C1w = [&](int i, int k, int j) -> double& { return cw[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
@@ -325,6 +347,56 @@ void radfg(int ido, int ip, int l1, int idl1, WaveTable_Double& c, WaveTable_Dou
     }
 }
 
+// Each pass is compiled twice from the same body: once where every table it reads is
+// known to be non-empty, so that the guarded reads' error branch folds away, and once
+// as written for the (never expected) empty table.
+bool nonEmpty(const Reader& r) { return r.length >= 1; }
+
+void radf2(int ido, int l1, Reader cc, double* ch, Reader wa1) {
+    if (nonEmpty(cc) && nonEmpty(wa1)) {
+        radf2Body(ido, l1, cc, ch, wa1);
+    } else {
+        radf2Body(ido, l1, cc, ch, wa1);
+    }
+}
+
+void radf3(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2) {
+    if (nonEmpty(cc) && nonEmpty(wa1) && nonEmpty(wa2)) {
+        radf3Body(ido, l1, cc, ch, wa1, wa2);
+    } else {
+        radf3Body(ido, l1, cc, ch, wa1, wa2);
+    }
+}
+
+void radf4(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2, Reader wa3) {
+    if (nonEmpty(cc) && nonEmpty(wa1) && nonEmpty(wa2) && nonEmpty(wa3)) {
+        radf4Body(ido, l1, cc, ch, wa1, wa2, wa3);
+    } else {
+        radf4Body(ido, l1, cc, ch, wa1, wa2, wa3);
+    }
+}
+
+void radf5(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2, Reader wa3,
+           Reader wa4) {
+    if (nonEmpty(cc) && nonEmpty(wa1) && nonEmpty(wa2) && nonEmpty(wa3) && nonEmpty(wa4)) {
+        radf5Body(ido, l1, cc, ch, wa1, wa2, wa3, wa4);
+    } else {
+        radf5Body(ido, l1, cc, ch, wa1, wa2, wa3, wa4);
+    }
+}
+
+// General odd factor; see radfgBody for the roles of the two tables.
+void radfg(int ido, int ip, int l1, int idl1, WaveTable_Double& c, WaveTable_Double& h,
+           Reader wa) {
+    const Reader cr = from(c, 0);
+    const Reader hr = from(h, 0);
+    if (nonEmpty(cr) && nonEmpty(hr) && nonEmpty(wa)) {
+        radfgBody(ido, ip, l1, idl1, cr, c.data, hr, h.data, wa);
+    } else {
+        radfgBody(ido, ip, l1, idl1, cr, c.data, hr, h.data, wa);
+    }
+}
+
 }  // namespace
 
 RealDoubleFFT::RealDoubleFFT(int n_) : n(n_), wavetable(new WaveTable_Double(2 * n_ + 15)) {
@@ -398,7 +470,7 @@ void RealDoubleFFT::forwardTransform(android::sp<WaveTable_Double> data) {
 
     android::sp<WaveTable_Double> work = new WaveTable_Double(n);
     const Reader wt = wavetable->reader();
-    for (int i = 0; i < n; ++i) work->set(i, wt[i]);
+    wt.copyTo(0, work->data, n);
 
     const int nf = static_cast<int>(wt[2 * n + 1]);
     if (nf < 1) return;
@@ -449,6 +521,5 @@ void RealDoubleFFT::forwardTransform(android::sp<WaveTable_Double> data) {
         l2 = l1;
     }
     if (na == 1) return;
-    const Reader w = ch.reader();
-    for (int i = 0; i < n; ++i) c.set(i, w[i]);
+    ch.reader().copyTo(0, c.data, n);
 }

@@ -1,6 +1,7 @@
 // Reference-counted tables of doubles that know their size.
 #pragma once
 #include <cstdint>
+#include <cstring>
 
 #include <utils/RefBase.h>
 
@@ -18,6 +19,17 @@ struct WaveTable_Reader {
     double operator[](int i) const {
         if (__builtin_expect(length < 1, 0)) return WaveTable_emptyRead();
         return data[i];
+    }
+
+    // Guarded reads of `count` entries from position `from` into dst, the length test
+    // made once for the block.
+    void copyTo(int from, double* dst, int count) const {
+        if (count < 1) return;
+        if (__builtin_expect(length < 1, 0)) {
+            for (int k = 0; k < count; ++k) dst[k] = WaveTable_emptyRead();
+            return;
+        }
+        std::memcpy(dst, data + from, static_cast<size_t>(count) * sizeof(double));
     }
 };
 

@@ -30,7 +30,7 @@ TEST_F(FrameExchangeTest, FirstUseInitialisesOnceAndReadsZeros) {
     EXPECT_EQ(record.reserved, 0);
     for (int16_t s : record.data) ASSERT_EQ(s, 0);
     read_write_audio(&unused, 0, &record);
-    EXPECT_EQ(logOf("TQX"), std::vector<std::string>{"D/[SoundMeter] Initialize MDATA\n"});
+    EXPECT_EQ(logOf("TQX"), std::vector<std::string>{"D/[SoundMeter] Initialize MDATA"});
 }
 
 TEST_F(FrameExchangeTest, OnlyDirectionOneWrites) {

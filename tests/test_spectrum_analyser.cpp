@@ -63,7 +63,9 @@ TEST_F(SpectrumAnalyserTest, FramesWithKnownSpectra) {
         spec = spectrumOf(*canvas);
         EXPECT_NEAR(spec[k], 256.0 * 0.5 / kDivisor, 1e-4);
         for (int i = 0; i < 256; ++i) {
-            if (i != k) EXPECT_LT(spec[i], 1e-4) << i;
+            if (i != k) {
+                EXPECT_LT(spec[i], 1e-4) << i;
+            }
         }
     }
     EXPECT_TRUE(kt::logLines().empty());
@@ -87,9 +89,170 @@ TEST_F(SpectrumAnalyserTest, CountSelectsTheAnalysedSamples) {
     // (the frame is its own heap block, so a read before it would trip the address checker).
     for (int count : {511, 100, 0, -7}) {
         SCOPED_TRACE("count " + std::to_string(count));
-        canvas->drawSpectrum(silenceOr(nullptr), 0);
+        std::vector<short> silence(512, 0);
+        canvas->drawSpectrum(silence.data(), 512);
         std::vector<short> exact(tone);
         canvas->drawSpectrum(exact.data(), count);
         EXPECT_EQ(spectrumOf(*canvas), want);
     }
+}
+
+TEST_F(SpectrumAnalyserTest, SetInputConvertsOrRefuses) {
+    std::vector<short> in(600);
+    for (int i = 0; i < 600; ++i) in[i] = static_cast<short>(i * 100 - 30000);
+    std::vector<double> out(514, 5.0);
+    canvas->SpectrumAnalyser_setInput(in.data(), 50, 512, out.data() + 1);
+    EXPECT_EQ(out[0], 5.0);
+    EXPECT_EQ(out[513], 5.0);
+    for (int i = 0; i < 512; ++i) EXPECT_EQ(out[1 + i], in[50 + i] / 32768.0) << i;
+    EXPECT_TRUE(kt::logLines().empty());
+
+    std::vector<double> untouched(512, 5.0);
+    canvas->SpectrumAnalyser_setInput(in.data(), 0, 511, untouched.data());
+    canvas->SpectrumAnalyser_setInput(in.data(), 0, 513, untouched.data());
+    for (double v : untouched) EXPECT_EQ(v, 5.0);
+    const auto lines = kt::logLines();
+    ASSERT_EQ(lines.size(), 2u);
+    EXPECT_EQ(lines[0].prio, 6);
+    EXPECT_EQ(lines[0].tag, "TQX");
+    EXPECT_EQ(lines[0].msg, "[WAVEFORM_CANVAS] SpectrumAnalyser_setInput: bad input count(511) in FFT");
+    EXPECT_EQ(lines[1].msg, "[WAVEFORM_CANVAS] SpectrumAnalyser_setInput: bad input count(513) in FFT");
+}
+
+TEST_F(SpectrumAnalyserTest, DirectResultsIntoTablesOfOtherSizes) {
+    const std::vector<short> tone = sineFrame(30, 0.5);
+    sp<WaveTable_Double> fft = new WaveTable_Double(512);
+    for (int i = 0; i < 512; ++i) fft->data[i] = tone[i] / 32768.0;
+    canvas->SpectrumAnalyser_Transform(fft);
+    sp<WaveTable_Double> full = new WaveTable_Double(256);
+    canvas->spectrumAnalyser_getResults_Last(fft, full);
+    EXPECT_TRUE(kt::logLines().empty());
+    EXPECT_NEAR(full->data[30], 128.0 / kDivisor, 1e-4);
+    // Magnitude: |X_i| narrowed to single precision, then divided in single precision.
+    const double a = fft->data[60], b = fft->data[59];
+    EXPECT_EQ(full->data[30], static_cast<double>(static_cast<float>(std::sqrt(a * a + b * b)) / 325.6832f));
+    EXPECT_EQ(full->data[0], static_cast<double>(static_cast<float>(std::fabs(fft->data[0])) / 325.6832f));
+
+    // Shorter: logged, the entries that fit are written and nothing past the end.
+    sp<WaveTable_Double> small = new WaveTable_Double(40);
+    canvas->spectrumAnalyser_getResults_Last(fft, small);
+    for (int i = 0; i < 40; ++i) EXPECT_EQ(small->data[i], full->data[i]);
+    // Longer: logged, 256 entries written, the rest kept.
+    sp<WaveTable_Double> big = new WaveTable_Double(300);
+    for (int i = 0; i < 300; ++i) big->data[i] = -1.0;
+    canvas->spectrumAnalyser_getResults_Last(fft, big);
+    for (int i = 0; i < 256; ++i) EXPECT_EQ(big->data[i], full->data[i]);
+    for (int i = 256; i < 300; ++i) EXPECT_EQ(big->data[i], -1.0);
+    const auto lines = kt::logLines();
+    ASSERT_EQ(lines.size(), 2u);
+    EXPECT_EQ(lines[0].prio, 6);
+    EXPECT_EQ(lines[0].tag, "TQX");
+    EXPECT_EQ(lines[0].msg, "[WAVEFORM_CANVAS] bad output buffer size in FFT: must be 256; given 40");
+    EXPECT_EQ(lines[1].msg, "[WAVEFORM_CANVAS] bad output buffer size in FFT: must be 256; given 300");
+}
+
+TEST_F(SpectrumAnalyserTest, AveragingPathWithWidthThree) {
+    // Three frames of different tone strengths on bin 12 and noise elsewhere.
+    std::vector<sp<WaveTable_Double>> frames;
+    std::vector<std::vector<float>> mags;
+    std::mt19937 rng(3);
+    std::uniform_int_distribution<int> noise(-2000, 2000);
+    for (double amp : {0.1, 0.4, 0.7}) {
+        std::vector<short> s = sineFrame(12, amp);
+        for (short& v : s) v = static_cast<short>(v / 2 + noise(rng));
+        sp<WaveTable_Double> t = new WaveTable_Double(512);
+        for (int i = 0; i < 512; ++i) t->data[i] = s[i] / 32768.0;
+        canvas->SpectrumAnalyser_Transform(t);
+        sp<WaveTable_Double> direct = new WaveTable_Double(256);
+        canvas->spectrumAnalyser_getResults_Last(t, direct);
+        mags.emplace_back(direct->data, direct->data + 256);
+        frames.push_back(t);
+    }
+
+    sp<WaveTable_Double> average = new WaveTable_Double(256);
+    sp<WaveTable_Double_2> history = new WaveTable_Double_2(256, 3);
+    testing::internal::CaptureStdout();
+    int index = 0;
+    std::vector<int> slots;
+    for (int f = 0; f < 3; ++f) {
+        index = canvas->spectrumAnalyser_getResults(frames[f], average, history, index);
+        slots.push_back(index);
+    }
+    const std::string line = "[WAVEFORM_CANVAS] spectrumAnalyser_getResults\n";
+    EXPECT_EQ(testing::internal::GetCapturedStdout(), line + line + line);
+    EXPECT_EQ(slots, (std::vector<int>{1, 2, 0}));
+    for (int i = 0; i < 256; ++i) {
+        EXPECT_EQ(history->data[i * 3 + 1], mags[0][i]);
+        EXPECT_EQ(history->data[i * 3 + 2], mags[1][i]);
+        EXPECT_EQ(history->data[i * 3 + 0], mags[2][i]);
+        const double mean = (static_cast<double>(mags[0][i]) + mags[1][i] + mags[2][i]) / 3.0;
+        EXPECT_NEAR(average->data[i], mean, 1e-6 * (1.0 + mean)) << i;
+    }
+    // A fourth call overwrites the oldest slot and keeps the mean of the last three.
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(canvas->spectrumAnalyser_getResults(frames[0], average, history, index), 1);
+    testing::internal::GetCapturedStdout();
+    EXPECT_NEAR(average->data[12], (static_cast<double>(mags[1][12]) + mags[2][12] + mags[0][12]) / 3.0, 1e-6);
+    EXPECT_TRUE(kt::logLines().empty());
+}
+
+TEST_F(SpectrumAnalyserTest, AveragingPathRefusesWrongSizes) {
+    sp<WaveTable_Double> fft = new WaveTable_Double(512);
+    fft->data[0] = 3.0;
+    sp<WaveTable_Double> average = new WaveTable_Double(256);
+    sp<WaveTable_Double> badAverage = new WaveTable_Double(255);
+    sp<WaveTable_Double_2> history = new WaveTable_Double_2(256, 2);
+    sp<WaveTable_Double_2> badHistory = new WaveTable_Double_2(10, 2);
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(canvas->spectrumAnalyser_getResults(fft, badAverage, badHistory, 0), -1);
+    EXPECT_EQ(canvas->spectrumAnalyser_getResults(fft, average, badHistory, 0), -1);
+    // Decided: a history without slots is refused the same way, without a line.
+    sp<WaveTable_Double_2> noSlots = new WaveTable_Double_2(256, 0);
+    EXPECT_EQ(canvas->spectrumAnalyser_getResults(fft, average, noSlots, 0), -1);
+    const std::string line = "[WAVEFORM_CANVAS] spectrumAnalyser_getResults\n";
+    EXPECT_EQ(testing::internal::GetCapturedStdout(), line + line + line);
+    for (int i = 0; i < 256; ++i) EXPECT_EQ(average->data[i], 0.0);
+    for (int i = 0; i < 20; ++i) EXPECT_EQ(badHistory->data[i], 0.0);
+    const auto lines = kt::logLines();
+    ASSERT_EQ(lines.size(), 2u);
+    EXPECT_EQ(lines[0].prio, 6);
+    EXPECT_EQ(lines[0].tag, "TQX");
+    EXPECT_EQ(lines[0].msg, "[WAVEFORM_CANVAS] bad average buffer size in FFT: must be 256 ; given 255");
+    EXPECT_EQ(lines[1].msg, "[WAVEFORM_CANVAS] bad history buffer size in FFT: must be 256 ; given 10");
+
+    // Index -1 (after a refusal) and indices outside the history start again at slot 0.
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(canvas->spectrumAnalyser_getResults(fft, average, history, -1), 0);
+    EXPECT_EQ(canvas->spectrumAnalyser_getResults(fft, average, history, 0), 1);
+    EXPECT_EQ(canvas->spectrumAnalyser_getResults(fft, average, history, 1), 0);
+    EXPECT_EQ(canvas->spectrumAnalyser_getResults(fft, average, history, 7), 0);
+    EXPECT_EQ(canvas->spectrumAnalyser_getResults(fft, average, history, -9), 0);
+    testing::internal::GetCapturedStdout();
+}
+
+TEST_F(SpectrumAnalyserTest, DrawSpectrumThroughTheHistory) {
+    canvas->historyLength = 3;
+    canvas->history = new WaveTable_Double_2(256, 3);
+    const std::vector<short> tone = sineFrame(50, 0.6);
+    testing::internal::CaptureStdout();
+    std::vector<int> indices;
+    for (int f = 0; f < 4; ++f) {
+        canvas->drawSpectrum(const_cast<short*>(tone.data()), 512);
+        indices.push_back(canvas->historyIndex);
+    }
+    EXPECT_EQ(indices, (std::vector<int>{1, 2, 0, 1}));
+    EXPECT_NEAR(canvas->spectrum->data[50], 256.0 * 0.6 / kDivisor, 1e-4);
+
+    // A refusal stores -1; the next frame writes slot 0.
+    sp<WaveTable_Double> keep = canvas->spectrum;
+    canvas->spectrum = new WaveTable_Double(100);
+    canvas->drawSpectrum(const_cast<short*>(tone.data()), 512);
+    EXPECT_EQ(canvas->historyIndex, -1);
+    canvas->spectrum = keep;
+    canvas->drawSpectrum(const_cast<short*>(tone.data()), 512);
+    EXPECT_EQ(canvas->historyIndex, 0);
+    testing::internal::GetCapturedStdout();
+    const auto lines = kt::logLines();
+    ASSERT_EQ(lines.size(), 1u);
+    EXPECT_EQ(lines[0].msg, "[WAVEFORM_CANVAS] bad average buffer size in FFT: must be 256 ; given 100");
 }

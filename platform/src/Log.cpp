@@ -69,13 +69,14 @@ void applyLocked(const char* target, const char* level) {
     }
 }
 
-char priorityLetter(int prio) {
-    static const char kLetters[] = "VDIWEF";
-    // Priorities outside verbose..fatal are written as the nearest of the two.
-    if (prio < ANDROID_LOG_VERBOSE) prio = ANDROID_LOG_VERBOSE;
-    if (prio > ANDROID_LOG_FATAL) prio = ANDROID_LOG_FATAL;
-    return kLetters[prio - ANDROID_LOG_VERBOSE];
+// Priorities outside verbose..fatal count as the nearest of the two.
+int clampPriority(int prio) {
+    if (prio < ANDROID_LOG_VERBOSE) return ANDROID_LOG_VERBOSE;
+    if (prio > ANDROID_LOG_FATAL) return ANDROID_LOG_FATAL;
+    return prio;
 }
+
+char priorityLetter(int prio) { return "VDIWEF"[clampPriority(prio) - ANDROID_LOG_VERBOSE]; }
 
 void writeAll(int fd, const char* p, size_t len) {
     while (len > 0) {
@@ -115,7 +116,7 @@ extern "C" int __android_log_print(int prio, const char* tag, const char* fmt, .
     {
         std::lock_guard<std::mutex> lock(gLogLock);
         if (!gConfig.loaded) applyLocked(std::getenv("KORVO_LOG"), std::getenv("KORVO_LOG_LEVEL"));
-        write = gConfig.fd >= 0 && prio >= gConfig.minPrio;
+        write = gConfig.fd >= 0 && clampPriority(prio) >= gConfig.minPrio;
     }
     if (!keep && !write) return 0;
 

@@ -17,22 +17,28 @@ namespace {
 
 constexpr size_t kDefaultMinFrameCount = 1024;
 
-// ---- log capture
 std::atomic<bool> gCaptureOn{false};
-std::mutex gCaptureLock;
-std::vector<test::LogLine> gCapturedLines;
-
-// ---- scripted microphone
 std::atomic<bool> gScriptOn{false};
-std::mutex gMicLock;
-std::condition_variable gMicCond;
-std::deque<int16_t> gMicSamples;
-std::deque<ssize_t> gMicResults;
-int gMicWaiting = 0;
 std::atomic<size_t> gLastMicRequest{0};
-
 std::atomic<size_t> gMinFrameCount{kDefaultMinFrameCount};
 std::atomic<android::status_t> gMinFrameCountFailure{android::OK};
+
+struct Controls {
+    std::mutex captureLock;
+    std::vector<test::LogLine> capturedLines;
+
+    std::mutex micLock;
+    std::condition_variable micCond;
+    std::deque<int16_t> micSamples;
+    std::deque<ssize_t> micResults;
+    int micWaiting = 0;  // scripted reads blocked now
+};
+
+// Never destroyed: streams and threads may still log or stop during static destruction.
+Controls& controls() {
+    static Controls* c = new Controls;
+    return *c;
+}
 
 }  // namespace
 
@@ -41,40 +47,43 @@ namespace detail {
 bool logCaptureOn() { return gCaptureOn.load(std::memory_order_relaxed); }
 
 void keepLogLine(int prio, const char* tag, const char* msg, size_t len) {
-    std::lock_guard<std::mutex> lock(gCaptureLock);
-    gCapturedLines.push_back(test::LogLine{prio, tag, std::string(msg, len)});
+    Controls& c = controls();
+    std::lock_guard<std::mutex> lock(c.captureLock);
+    c.capturedLines.push_back(test::LogLine{prio, tag, std::string(msg, len)});
 }
 
 bool micScriptOn() { return gScriptOn.load(std::memory_order_acquire); }
 
 ssize_t scriptedMicRead(int16_t* out, size_t bytes, const std::atomic<bool>& stopped) {
     size_t want = bytes / 2;  // whole samples only
-    std::unique_lock<std::mutex> lock(gMicLock);
-    if (!gMicResults.empty()) {
-        const ssize_t result = gMicResults.front();
-        gMicResults.pop_front();
+    Controls& c = controls();
+    std::unique_lock<std::mutex> lock(c.micLock);
+    if (!c.micResults.empty()) {
+        const ssize_t result = c.micResults.front();
+        c.micResults.pop_front();
         if (result <= 0) return result;
         want = std::min(want, static_cast<size_t>(result) / 2);
     }
     auto answerable = [&] {
-        return gMicSamples.size() >= want || stopped.load(std::memory_order_acquire) ||
+        return c.micSamples.size() >= want || stopped.load(std::memory_order_acquire) ||
                !gScriptOn.load(std::memory_order_acquire);
     };
     if (!answerable()) {
-        ++gMicWaiting;
-        gMicCond.wait(lock, answerable);
-        --gMicWaiting;
+        ++c.micWaiting;
+        c.micCond.wait(lock, answerable);
+        --c.micWaiting;
     }
     // Stopped or switched off: what is queued so far, as a stopped device would deliver.
-    const size_t n = std::min(want, gMicSamples.size());
-    std::copy_n(gMicSamples.begin(), n, out);
-    gMicSamples.erase(gMicSamples.begin(), gMicSamples.begin() + static_cast<ptrdiff_t>(n));
+    const size_t n = std::min(want, c.micSamples.size());
+    std::copy_n(c.micSamples.begin(), n, out);
+    c.micSamples.erase(c.micSamples.begin(), c.micSamples.begin() + static_cast<ptrdiff_t>(n));
     return static_cast<ssize_t>(n * 2);
 }
 
 void wakeMicReaders() {
-    std::lock_guard<std::mutex> lock(gMicLock);
-    gMicCond.notify_all();
+    Controls& c = controls();
+    std::lock_guard<std::mutex> lock(c.micLock);
+    c.micCond.notify_all();
 }
 
 void noteMicRead(size_t bytes) { gLastMicRequest.store(bytes, std::memory_order_relaxed); }
@@ -94,11 +103,12 @@ void resetAll() {
     captureLog(false);
     clearLog();
     {
-        std::lock_guard<std::mutex> lock(gMicLock);
+        Controls& c = controls();
+        std::lock_guard<std::mutex> lock(c.micLock);
         gScriptOn.store(false, std::memory_order_release);
-        gMicSamples.clear();
-        gMicResults.clear();
-        gMicCond.notify_all();
+        c.micSamples.clear();
+        c.micResults.clear();
+        c.micCond.notify_all();
     }
     gLastMicRequest.store(0, std::memory_order_relaxed);
     gMinFrameCount.store(kDefaultMinFrameCount, std::memory_order_relaxed);
@@ -109,43 +119,50 @@ void resetAll() {
 void captureLog(bool on) { gCaptureOn.store(on, std::memory_order_relaxed); }
 
 std::vector<LogLine> logLines() {
-    std::lock_guard<std::mutex> lock(gCaptureLock);
-    return gCapturedLines;
+    Controls& c = controls();
+    std::lock_guard<std::mutex> lock(c.captureLock);
+    return c.capturedLines;
 }
 
 void clearLog() {
-    std::lock_guard<std::mutex> lock(gCaptureLock);
-    gCapturedLines.clear();
+    Controls& c = controls();
+    std::lock_guard<std::mutex> lock(c.captureLock);
+    c.capturedLines.clear();
 }
 
 void scriptMic(bool on) {
-    std::lock_guard<std::mutex> lock(gMicLock);
+    Controls& c = controls();
+    std::lock_guard<std::mutex> lock(c.micLock);
     gScriptOn.store(on, std::memory_order_release);
-    gMicCond.notify_all();  // readers waiting on the script give up when it goes off
+    c.micCond.notify_all();  // readers waiting on the script give up when it goes off
 }
 
 void pushMicSamples(const int16_t* samples, size_t count) {
-    std::lock_guard<std::mutex> lock(gMicLock);
-    gMicSamples.insert(gMicSamples.end(), samples, samples + count);
-    gMicCond.notify_all();
+    Controls& c = controls();
+    std::lock_guard<std::mutex> lock(c.micLock);
+    c.micSamples.insert(c.micSamples.end(), samples, samples + count);
+    c.micCond.notify_all();
 }
 
 void pushMicResult(ssize_t result) {
-    std::lock_guard<std::mutex> lock(gMicLock);
-    gMicResults.push_back(result);
-    gMicCond.notify_all();
+    Controls& c = controls();
+    std::lock_guard<std::mutex> lock(c.micLock);
+    c.micResults.push_back(result);
+    c.micCond.notify_all();
 }
 
 int micReadersWaiting() {
-    std::lock_guard<std::mutex> lock(gMicLock);
-    return gMicWaiting;
+    Controls& c = controls();
+    std::lock_guard<std::mutex> lock(c.micLock);
+    return c.micWaiting;
 }
 
 size_t lastMicReadRequest() { return gLastMicRequest.load(std::memory_order_relaxed); }
 
 size_t micSamplesQueued() {
-    std::lock_guard<std::mutex> lock(gMicLock);
-    return gMicSamples.size();
+    Controls& c = controls();
+    std::lock_guard<std::mutex> lock(c.micLock);
+    return c.micSamples.size();
 }
 
 void setMinFrameCount(size_t frames) { gMinFrameCount.store(frames, std::memory_order_relaxed); }

@@ -49,6 +49,8 @@ status_t Thread::run(const char* name, int32_t /*priority*/, size_t stack) {
         mStarted = false;
     }
 
+    (void)mCanCallJava;  // no managed runtime here to attach the thread to
+
     auto* info = new (std::nothrow) StartInfo{this, {}};
     if (!info) return NO_MEMORY;
     std::strncpy(info->name, name ? name : "Thread", sizeof(info->name) - 1);

@@ -56,7 +56,8 @@ public:
     bool stopped() const;
 
     // Blocking: waits until `size` bytes are there, the stream is stopped, or an error occurs.
-    // Returns the byte count delivered or a negative status.
+    // Returns the byte count delivered or a negative status. Reads are synchronous only:
+    // a non-blocking read returns INVALID_OPERATION.
     ssize_t read(void* buffer, size_t size, bool blocking = true);
 
     size_t frameCount() const;

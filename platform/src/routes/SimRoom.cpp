@@ -1,16 +1,157 @@
-// Placeholder until the simulated room lands.
+// The sim:ROOM routes: loudspeakers and microphones of processes that meet in a
+// room in shared memory (see SimRoomMembership.h and SimRoomSlot.h).
+#include <log/log.h>
+#include <utils/Errors.h>
+
+#include <algorithm>
+#include <cmath>
+#include <cstdint>
+
 #include "routes/RouteFactories.h"
+#include "routes/SimRoomClock.h"
+#include "routes/SimRoomConfig.h"
+#include "routes/SimRoomLayout.h"
+#include "routes/SimRoomMembership.h"
+#include "routes/SimRoomNoise.h"
+#include "routes/SimRoomSlot.h"
 
 namespace korvo {
 namespace platform {
 
-std::unique_ptr<CaptureRoute> makeSimCaptureRoute(const std::string&, std::string* error) {
-    if (error) *error = "the sim route is not available in this build";
-    return nullptr;
+namespace {
+
+using sim::RoomMembership;
+
+constexpr const char* kTag = "SimRoom";
+// Work is done in pieces of this many samples (stack buffers, bounded pacing).
+constexpr size_t kChunk = 1024;
+// A speaker whose next position is closer to "now" than this starts over at
+// now + latency: anything later might miss a microphone that already read it.
+constexpr int64_t kResyncMargin = sim::kLatencySamples / 4;
+// A microphone more than this far behind drops its backlog, as a capture buffer
+// that overran would.
+constexpr int64_t kMaxBacklog = sim::kRoomRate;
+
+bool checkRate(uint32_t sampleRate, const char* what) {
+    if (sampleRate == sim::kRoomRate) return true;
+    __android_log_print(ANDROID_LOG_ERROR, kTag, "sim room %s runs at %u Hz only, not %u Hz", what,
+                        unsigned(sim::kRoomRate), unsigned(sampleRate));
+    return false;
 }
-std::unique_ptr<OutputRoute> makeSimOutputRoute(const std::string&, std::string* error) {
-    if (error) *error = "the sim route is not available in this build";
-    return nullptr;
+
+class SimOutputRoute : public OutputRoute {
+public:
+    explicit SimOutputRoute(std::unique_ptr<RoomMembership> room)
+        : mRoom(std::move(room)),
+          // A slot left by an earlier speaker may reach into the future; continue after it.
+          mNext(mRoom->slot().end.load(std::memory_order_relaxed)) {}
+
+    int open(uint32_t sampleRate) override {
+        if (!checkRate(sampleRate, "speaker")) return android::BAD_VALUE;
+        mWaiter.rearm();
+        return android::OK;
+    }
+
+    // Real-time: no allocation; blocks only to pace the caller, until stop().
+    void write(const int16_t* samples, size_t count) override {
+        while (count > 0 && !mWaiter.stopped()) {
+            const size_t n = std::min(count, kChunk);
+            const int64_t now = sim::timelineNow();
+            if (mNext < now + kResyncMargin) mNext = now + sim::kLatencySamples;
+            sim::placeSamples(mRoom->slot(), mNext, samples, n);
+            mNext += int64_t(n);
+            samples += n;
+            count -= n;
+            // Ready for more when exactly the latency is left queued.
+            if (!mWaiter.waitFor(mNext - sim::kLatencySamples)) return;
+        }
+    }
+
+    void stop() override { mWaiter.stop(); }
+
+private:
+    std::unique_ptr<RoomMembership> mRoom;
+    int64_t mNext;  // timeline position of the next sample to write
+    sim::TimelineWaiter mWaiter;
+};
+
+class SimCaptureRoute : public CaptureRoute {
+public:
+    SimCaptureRoute(std::unique_ptr<RoomMembership> room, const sim::MicSettings& settings)
+        : mRoom(std::move(room)),
+          mGain(std::pow(10.0, settings.gainDb / 20.0)),
+          mNoiseRms(settings.noiseDbfs ? 32768.0 * std::pow(10.0, *settings.noiseDbfs / 20.0) : 0.0),
+          mNoise(settings.seed) {}
+
+    int open(uint32_t sampleRate) override {
+        if (!checkRate(sampleRate, "microphone")) return android::BAD_VALUE;
+        mWaiter.rearm();
+        mReadPos = sim::timelineNow();  // hears what is played from now on
+        mOpened = true;
+        return android::OK;
+    }
+
+    ssize_t read(int16_t* out, size_t count) override {
+        if (!mOpened) return android::NO_INIT;
+        const int64_t now = sim::timelineNow();
+        if (now - mReadPos > kMaxBacklog) mReadPos = now;
+        size_t n = count;
+        if (!mWaiter.waitFor(mReadPos + int64_t(count))) {
+            // Stopped: hand over what has already been heard.
+            n = size_t(std::clamp<int64_t>(sim::timelineNow() - mReadPos, 0, int64_t(count)));
+        }
+        for (size_t done = 0; done < n;) {
+            const size_t part = std::min(n - done, kChunk);
+            hear(mReadPos, part, out + done);
+            mReadPos += int64_t(part);
+            done += part;
+        }
+        return ssize_t(n);
+    }
+
+    void stop() override { mWaiter.stop(); }
+
+private:
+    // Mixes every speaker over [position, position + count), count <= kChunk.
+    void hear(int64_t position, size_t count, int16_t* out) {
+        int32_t mix[kChunk] = {};
+        int16_t scratch[kChunk];
+        for (const sim::SpeakerSlot& slot : mRoom->layout().slots) {
+            const sim::SlotSpan span = sim::readSamples(slot, position, count, scratch);
+            for (int64_t p = span.from; p < span.to; ++p) mix[p - position] += scratch[p - position];
+        }
+        for (size_t i = 0; i < count; ++i) {
+            double v = double(mix[i]) * mGain;
+            if (mNoiseRms > 0.0) v += mNoiseRms * mNoise.next();
+            v = std::nearbyint(std::clamp(v, -32768.0, 32767.0));
+            out[i] = int16_t(v);
+        }
+    }
+
+    std::unique_ptr<RoomMembership> mRoom;
+    const double mGain;
+    const double mNoiseRms;
+    sim::NoiseSource mNoise;
+    int64_t mReadPos = 0;  // timeline position of the next sample to deliver
+    bool mOpened = false;
+    sim::TimelineWaiter mWaiter;
+};
+
+}  // namespace
+
+std::unique_ptr<CaptureRoute> makeSimCaptureRoute(const std::string& room, std::string* error) {
+    if (!sim::validateRoomName(room, error)) return nullptr;
+    const std::optional<sim::MicSettings> settings = sim::micSettingsFromEnv(error);
+    if (!settings) return nullptr;
+    auto membership = RoomMembership::join(room, RoomMembership::Role::Microphone, error);
+    if (!membership) return nullptr;
+    return std::make_unique<SimCaptureRoute>(std::move(membership), *settings);
+}
+
+std::unique_ptr<OutputRoute> makeSimOutputRoute(const std::string& room, std::string* error) {
+    auto membership = RoomMembership::join(room, RoomMembership::Role::Speaker, error);
+    if (!membership) return nullptr;
+    return std::make_unique<SimOutputRoute>(std::move(membership));
 }
 
 }  // namespace platform

@@ -7,6 +7,10 @@
 //   card[:DEV]  a real sound card
 // The microphone's ROUTE comes from KORVO_MIC, the speaker's from KORVO_SPEAKER
 // (both default to null); a host may set them with setenv before it opens streams.
+//
+// A route's open, read and write come from one thread at a time; stop() may come from
+// any thread. A stop lasts until the next open(), which resumes the route (a file goes
+// on where it was).
 #pragma once
 #include <sys/types.h>
 

@@ -1,0 +1,57 @@
+// One meter object of the plug-in, brought up and down in the order the interface
+// requires, with the polling loops every command uses.
+#pragma once
+#include <cstdint>
+#include <string>
+
+#include "host/Plugin.h"
+#include "interface/SoundMeter_vir.h"
+
+namespace korvo {
+namespace host {
+
+// Time a tone needs after its duration to be out of the room: the fade-out block
+// (20 ms), the route's latency and some slack for a loaded machine.
+constexpr int kToneTailMs = 250;
+
+struct DeviceSettings {
+    int role = 0;           // 1 listener, 2 speaker, 3 both
+    bool needAck = false;
+    bool setLevel = false;  // leave the detection level alone unless asked
+    int level = 0;
+};
+
+enum class Heard { Yes, TimedOut, Interrupted };
+
+class Device {
+public:
+    explicit Device(const Plugin& plugin) : mPlugin(plugin) {}
+    Device(const Device&) = delete;
+    Device& operator=(const Device&) = delete;
+    ~Device() { close(); }
+
+    // maker -> makeToneGenerator -> start_wf_thread -> startRecord -> configuration.
+    bool open(const DeviceSettings& settings, std::string* error);
+    // stopRecord -> end_wf_thread -> releaseToneGenerator -> soundMeter_destroy.
+    void close();
+
+    SoundMeter_vir& meter() { return *mMeter; }
+
+    // HearFreqIdx(code), one capture step per call, until heard, the deadline
+    // (monotonic ms) or an interrupt.
+    Heard hearUntil(int code, int64_t deadlineMs);
+    // Says one code. The saying gate is re-armed first (speaker state 0): on its own
+    // the state machine lets a device say once per exchange, and a device running
+    // several rounds has to open it again each time.
+    void sayCode(int code, int durationMs);
+    // Capture steps until the deadline, so the microphone stays drained while the
+    // device waits; false when interrupted.
+    bool stepUntil(int64_t deadlineMs);
+
+private:
+    const Plugin& mPlugin;
+    SoundMeter_vir* mMeter = nullptr;
+};
+
+}  // namespace host
+}  // namespace korvo

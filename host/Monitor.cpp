@@ -1,0 +1,125 @@
+// soundmeter monitor: a live view of the read-out in the terminal.
+#include <unistd.h>
+
+#include <string>
+
+#include <CLI/CLI.hpp>
+
+#include "host/Clock.h"
+#include "host/CodePlan.h"
+#include "host/CodeTracker.h"
+#include "host/Interrupt.h"
+#include "host/Options.h"
+#include "host/Output.h"
+#include "host/Session.h"
+#include "host/Spectrum.h"
+
+namespace korvo {
+namespace host {
+namespace {
+
+struct MonitorOptions {
+    int level = 0;
+    bool levelGiven = false;
+    double seconds = 0.0;  // 0: until Ctrl-C
+};
+
+constexpr int64_t kRefreshMs = 150;
+constexpr int kBarWidth = 50;  // two level units per character, level 100 = full scale
+constexpr int kFrameLines = kHearableCodes + 4;
+
+std::string bar(float level, int detection) {
+    int n = level <= 0.0f ? 0 : static_cast<int>(level / 2.0f);
+    if (n > kBarWidth) n = kBarWidth;
+    std::string s(static_cast<size_t>(n), '#');
+    s.resize(kBarWidth, '.');
+    int mark = detection / 2;  // where the detection level sits
+    if (detection > 0 && mark < kBarWidth && s[static_cast<size_t>(mark)] == '.') s[static_cast<size_t>(mark)] = '|';
+    return s;
+}
+
+void drawFrame(bool ansi, bool first, SoundMeter_vir& meter, const SpectrumLook& look, int heard,
+               double elapsed) {
+    const char* eol = ansi ? "\x1b[K\n" : "\n";
+    std::string frame;
+    if (ansi && !first) frame += "\x1b[" + std::to_string(kFrameLines) + "F";  // back to the frame's top
+    char line[256];
+    int detection = meter.getDetectionLevel();
+    snprintf(line, sizeof line, "%6.1f s  detection level %d  %s%s", elapsed, detection,
+             look.bins == 0 ? "(no spectrum yet)" : "", eol);
+    frame += line;
+    for (int c = 0; c < kHearableCodes; ++c) {
+        float v = look.levels[codeIndex(c)];
+        snprintf(line, sizeof line, "code %2d %5d Hz %s %5.1f%s", c, codeHz(c), bar(v, detection).c_str(), v, eol);
+        frame += line;
+    }
+    snprintf(line, sizeof line, "codes 18..22 masked out by the read-out, 23..39 beyond the spectrum%s", eol);
+    frame += line;
+    if (heard >= 0) {
+        snprintf(line, sizeof line, "heard: code %d (%d Hz)%s", heard, codeHz(heard), eol);
+    } else {
+        snprintf(line, sizeof line, "heard: -%s", eol);
+    }
+    frame += line;
+    frame += ansi ? "\x1b[K\n" : "\n";
+    outf("%s", frame.c_str());
+}
+
+int runMonitor(const CommonOptions& common, const MonitorOptions& o) {
+    Session session(common);
+    DeviceSettings settings;
+    settings.role = 1;
+    settings.setLevel = o.levelGiven;
+    settings.level = o.level;
+    if (int status = session.open(settings)) return status;
+    SoundMeter_vir& meter = session.meter();
+    // Redraw in place on a terminal; elsewhere (a pipe, a file) frames follow each other.
+    bool ansi = isatty(STDOUT_FILENO) != 0;
+    if (ansi) outf("\x1b[?25l");  // no blinking cursor over the bars
+
+    CodeTracker tracker;
+    SpectrumLook look;
+    int64_t start = monotonicMs();
+    int64_t end = o.seconds > 0 ? start + static_cast<int64_t>(o.seconds * 1000.0) : INT64_MAX;
+    int64_t nextDraw = start;
+    bool first = true;
+    for (int64_t now = start; now < end && !interrupted(); now = monotonicMs()) {
+        meter.processAudio();
+        lookAtSpectrum(meter, &look);
+        tracker.update(monotonicMs(), look.codeFirst, look.codeSecond);
+        if (now >= nextDraw) {
+            drawFrame(ansi, first, meter, look, tracker.current(), (now - start) / 1000.0);
+            first = false;
+            nextDraw = now + kRefreshMs;
+        }
+    }
+    if (ansi) outf("\x1b[?25h");
+    session.close();
+    return 0;  // Ctrl-C is the normal end
+}
+
+}  // namespace
+
+Command addMonitorCommand(CLI::App& app, CommonOptions& common) {
+    auto options = std::make_shared<MonitorOptions>();
+    CLI::App* sub = app.add_subcommand(
+        "monitor",
+        "Live view of the read-out: the level of each hearable code's band as a bar, the detection level "
+        "and the code heard; Ctrl-C ends it.");
+    sub->add_option_function<int>(
+           "--level",
+           [options](const int& v) {
+               options->level = v;
+               options->levelGiven = true;
+           },
+           "detection level: spectrum levels at or below it count as silence")
+        ->check(CLI::Range(-1000, 1000));
+    sub->add_option("--seconds", options->seconds, "stop after this many seconds; 0: until Ctrl-C")
+        ->check(CLI::Range(0.0, 86400.0))
+        ->capture_default_str();
+    addRouteOptions(sub, common);
+    return {sub, [&common, options] { return runMonitor(common, *options); }};
+}
+
+}  // namespace host
+}  // namespace korvo

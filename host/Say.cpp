@@ -1,0 +1,57 @@
+// soundmeter say CODE: one code, said once by a speaker device.
+#include <CLI/CLI.hpp>
+
+#include "host/Clock.h"
+#include "host/CodePlan.h"
+#include "host/Interrupt.h"
+#include "host/Options.h"
+#include "host/Output.h"
+#include "host/Session.h"
+
+namespace korvo {
+namespace host {
+namespace {
+
+struct SayOptions {
+    int code = 0;
+    int ms = 500;
+};
+
+int runSay(const CommonOptions& common, const SayOptions& o) {
+    Session session(common);
+    DeviceSettings settings;
+    settings.role = 2;  // speaker, no acknowledgement: saying leaves nothing to wait for
+    if (int status = session.open(settings)) return status;
+    if (!codeHearable(o.code)) errf("note: code %d (%d Hz) %s", o.code, codeHz(o.code), codeReach(o.code));
+
+    int64_t start = monotonicMs();
+    session.device().sayCode(o.code, o.ms);
+    outf("saying code %d (%d Hz) for %d ms\n", o.code, codeHz(o.code), o.ms);
+    // The engine fades the tone out by itself; tearing down earlier would cut it.
+    bool done = session.device().stepUntil(start + o.ms + kToneTailMs);
+    session.close();
+    if (!done) {
+        errf("interrupted before code %d was said to the end", o.code);
+        return 1;
+    }
+    outf("said code %d (%d Hz)\n", o.code, codeHz(o.code));
+    return 0;
+}
+
+}  // namespace
+
+Command addSayCommand(CLI::App& app, CommonOptions& common) {
+    auto options = std::make_shared<SayOptions>();
+    CLI::App* sub = app.add_subcommand("say", "Say one code (role speaker) and wait until its tone has ended.");
+    sub->add_option("CODE", options->code, "code to say, 0..39 (only 0..17 can be heard)")
+        ->required()
+        ->check(CLI::Range(0, kCodeCount - 1));
+    sub->add_option("--ms", options->ms, "tone duration in milliseconds")
+        ->check(CLI::Range(1, 60000))
+        ->capture_default_str();
+    addRouteOptions(sub, common);
+    return {sub, [&common, options] { return runSay(common, *options); }};
+}
+
+}  // namespace host
+}  // namespace korvo

@@ -1,0 +1,39 @@
+// Everything one device process needs around its meter object: the environment,
+// the plug-in's standard output, the loaded plug-in and the device itself.
+#pragma once
+#include <memory>
+
+#include "host/Device.h"
+#include "host/Options.h"
+#include "host/Output.h"
+#include "host/Plugin.h"
+
+namespace korvo {
+namespace host {
+
+class Session {
+public:
+    explicit Session(const CommonOptions& common) : mCommon(common) {}
+    Session(const Session&) = delete;
+    Session& operator=(const Session&) = delete;
+    ~Session() { close(); }
+
+    // Brings the device up. 0 on success; otherwise one line was printed and the
+    // result is the exit status (2 for a bad route, 1 when the plug-in or the
+    // device failed). Without a handler the plug-in's stdout lines follow -v.
+    int open(const DeviceSettings& settings, LibraryStdout::LineHandler handler = nullptr);
+    // Tears down in order: device, plug-in, standard output.
+    void close();
+
+    Device& device() { return *mDevice; }
+    SoundMeter_vir& meter() { return mDevice->meter(); }
+
+private:
+    CommonOptions mCommon;
+    LibraryStdout mStdout;
+    Plugin mPlugin;
+    std::unique_ptr<Device> mDevice;
+};
+
+}  // namespace host
+}  // namespace korvo

@@ -1,0 +1,274 @@
+#include "routes/SimRoomMembership.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/file.h>
+#include <sys/mman.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include "routes/SimRoomConfig.h"
+
+namespace korvo {
+namespace platform {
+namespace sim {
+
+namespace {
+
+// Where glibc keeps shm_open objects; only used to find abandoned rooms.
+constexpr const char* kShmDir = "/dev/shm";
+// A joiner whose room keeps being unlinked under it gives up after this many tries.
+constexpr int kJoinAttempts = 50;
+
+std::string errnoText(int err) { return std::strerror(err); }
+
+void lockFile(int fd) {
+    while (flock(fd, LOCK_EX) == -1 && errno == EINTR) {
+    }
+}
+
+void unlockFile(int fd) { flock(fd, LOCK_UN); }
+
+// True while `name` still refers to the object open on fd.
+bool stillNamed(int fd, const std::string& name) {
+    const int other = shm_open(name.c_str(), O_RDWR | O_CLOEXEC, 0);
+    if (other < 0) return false;
+    struct stat a{}, b{};
+    const bool same = fstat(fd, &a) == 0 && fstat(other, &b) == 0 && a.st_dev == b.st_dev &&
+                      a.st_ino == b.st_ino;
+    close(other);
+    return same;
+}
+
+RoomLayout* mapLayout(int fd) {
+    void* p = mmap(nullptr, sizeof(RoomLayout), PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0);
+    return p == MAP_FAILED ? nullptr : static_cast<RoomLayout*>(p);
+}
+
+void unmapLayout(RoomLayout* layout) {
+    if (layout) munmap(layout, sizeof(RoomLayout));
+}
+
+bool compatible(const RoomHeader& h) {
+    return h.magic.load(std::memory_order_acquire) == kRoomMagic && h.version == kRoomVersion &&
+           h.sampleRate == kRoomRate && h.speakerSlots == kSpeakerSlots &&
+           h.maxMembers == kMaxMembers && h.ringSamples == uint64_t(kRingSamples) &&
+           h.layoutSize == sizeof(RoomLayout);
+}
+
+bool alive(uint64_t identity) {
+    return identity != 0 && processIdentity(int(identity >> 32)) == identity;
+}
+
+// Frees the entries of processes that are gone; returns the members still there.
+// Called with the room's lock held.
+int forgetDeparted(RoomLayout& layout) {
+    int live = 0;
+    for (auto& member : layout.header.members) {
+        const uint64_t id = member.load(std::memory_order_acquire);
+        if (id == 0) continue;
+        if (alive(id)) {
+            ++live;
+        } else {
+            member.store(0, std::memory_order_release);
+        }
+    }
+    for (auto& slot : layout.slots) {
+        const uint64_t id = slot.owner.load(std::memory_order_acquire);
+        if (id != 0 && !alive(id)) slot.owner.store(0, std::memory_order_release);
+    }
+    return live;
+}
+
+// Unlinks the room `name` if nobody uses it any more. Never waits: a room whose
+// lock is taken is in use.
+void reclaimIfAbandoned(const std::string& name) {
+    const int fd = shm_open(name.c_str(), O_RDWR | O_CLOEXEC, 0);
+    if (fd < 0) return;
+    if (flock(fd, LOCK_EX | LOCK_NB) == 0) {
+        struct stat st{};
+        if (fstat(fd, &st) == 0 && st.st_uid == geteuid() && stillNamed(fd, name)) {
+            bool abandoned = false;
+            if (st.st_size == 0) {
+                abandoned = true;  // its creator died before setting it up, or will retry
+            } else if (size_t(st.st_size) == sizeof(RoomLayout)) {
+                if (RoomLayout* layout = mapLayout(fd)) {
+                    const uint64_t magic = layout->header.magic.load(std::memory_order_acquire);
+                    abandoned = magic == 0 || (compatible(layout->header) && forgetDeparted(*layout) == 0);
+                    unmapLayout(layout);
+                }
+            }
+            if (abandoned) shm_unlink(name.c_str());
+        }
+    }
+    close(fd);  // also drops the lock
+}
+
+void reclaimAbandonedRooms(const std::string& except) {
+    DIR* dir = opendir(kShmDir);
+    if (!dir) return;
+    const std::string prefix = roomObjectPrefix();
+    while (const dirent* entry = readdir(dir)) {
+        const std::string name = std::string("/") + entry->d_name;
+        if (name != except && std::strncmp(entry->d_name, prefix.c_str(), prefix.size()) == 0) {
+            reclaimIfAbandoned(name);
+        }
+    }
+    closedir(dir);
+}
+
+void setUp(RoomLayout& layout) {
+    RoomHeader& h = layout.header;
+    h.version = kRoomVersion;
+    h.sampleRate = kRoomRate;
+    h.speakerSlots = kSpeakerSlots;
+    h.maxMembers = kMaxMembers;
+    h.ringSamples = uint64_t(kRingSamples);
+    h.layoutSize = sizeof(RoomLayout);
+    h.magic.store(kRoomMagic, std::memory_order_release);
+}
+
+}  // namespace
+
+uint64_t processIdentity(int pid) {
+    if (pid <= 0) return 0;
+    char path[64];
+    std::snprintf(path, sizeof path, "/proc/%d/stat", pid);
+    const int fd = open(path, O_RDONLY | O_CLOEXEC);
+    if (fd < 0) {
+        // Without /proc, fall back to the pid alone.
+        if (access("/proc/self/stat", R_OK) != 0 && (kill(pid, 0) == 0 || errno == EPERM)) {
+            return uint64_t(pid) << 32;
+        }
+        return 0;
+    }
+    char buf[1024];
+    const ssize_t n = read(fd, buf, sizeof buf - 1);
+    close(fd);
+    if (n <= 0) return 0;
+    buf[n] = '\0';
+    // Fields after the command name: state is field 3, start time field 22.
+    const char* p = std::strrchr(buf, ')');
+    if (!p) return 0;
+    char state = 0;
+    unsigned long long start = 0;
+    if (std::sscanf(p + 1,
+                    " %c %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %llu",
+                    &state, &start) != 2) {
+        return 0;
+    }
+    if (state == 'Z' || state == 'X') return 0;
+    return (uint64_t(pid) << 32) | uint32_t(start);
+}
+
+std::unique_ptr<RoomMembership> RoomMembership::join(const std::string& room, Role role,
+                                                     std::string* error) {
+    auto fail = [&](const std::string& why) {
+        if (error) *error = why;
+        return std::unique_ptr<RoomMembership>();
+    };
+    if (!validateRoomName(room, error)) return nullptr;
+    const std::string name = roomObjectName(room);
+    const uint64_t self = processIdentity(getpid());
+    if (self == 0) return fail("sim room '" + room + "': cannot identify this process");
+    reclaimAbandonedRooms(name);
+
+    for (int attempt = 0; attempt < kJoinAttempts; ++attempt) {
+        const int fd = shm_open(name.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600);
+        if (fd < 0) return fail("cannot open sim room '" + room + "': " + errnoText(errno));
+        lockFile(fd);
+        // Closing fd drops the lock on every path below.
+        auto failClosed = [&](const std::string& why) {
+            close(fd);
+            return fail(why);
+        };
+        struct stat st{};
+        if (fstat(fd, &st) != 0) return failClosed("cannot inspect sim room '" + room + "'");
+        if (st.st_uid != geteuid()) return failClosed("sim room '" + room + "' belongs to another user");
+        if (!stillNamed(fd, name)) {  // unlinked by its last leaver while we waited
+            close(fd);
+            continue;
+        }
+        if ((st.st_mode & 0777) != 0600) fchmod(fd, 0600);  // the umask may have narrowed it
+
+        bool fresh = st.st_size == 0;
+        if (!fresh && size_t(st.st_size) != sizeof(RoomLayout)) {
+            return failClosed("sim room '" + room + "' was made by an incompatible build");
+        }
+        if (!fresh) {
+            RoomLayout* probe = mapLayout(fd);
+            if (!probe) return failClosed("cannot map sim room '" + room + "': " + errnoText(errno));
+            const uint64_t magic = probe->header.magic.load(std::memory_order_acquire);
+            const bool ok = compatible(probe->header);
+            unmapLayout(probe);
+            if (magic == 0) {
+                fresh = ftruncate(fd, 0) == 0;  // its creator died half-way: start clean
+            } else if (!ok) {
+                return failClosed("sim room '" + room + "' was made by an incompatible build");
+            }
+        }
+        if (fresh && ftruncate(fd, off_t(sizeof(RoomLayout))) != 0) {
+            return failClosed("cannot size sim room '" + room + "': " + errnoText(errno));
+        }
+        RoomLayout* layout = mapLayout(fd);
+        if (!layout) return failClosed("cannot map sim room '" + room + "': " + errnoText(errno));
+        if (fresh) setUp(*layout);
+        forgetDeparted(*layout);
+
+        std::unique_ptr<RoomMembership> m(new RoomMembership());
+        m->mObjectName = name;
+        m->mFd = fd;
+        m->mLayout = layout;
+        for (int i = 0; i < kMaxMembers && m->mMember < 0; ++i) {
+            if (layout->header.members[i].load(std::memory_order_acquire) == 0) {
+                layout->header.members[i].store(self, std::memory_order_release);
+                m->mMember = i;
+            }
+        }
+        if (m->mMember < 0) {
+            unlockFile(fd);
+            m.reset();
+            return fail("sim room '" + room + "' is full (" + std::to_string(kMaxMembers) +
+                        " devices)");
+        }
+        if (role == Role::Speaker) {
+            for (int i = 0; i < kSpeakerSlots && m->mSlot < 0; ++i) {
+                if (layout->slots[i].owner.load(std::memory_order_acquire) == 0) {
+                    layout->slots[i].owner.store(self, std::memory_order_release);
+                    m->mSlot = i;
+                }
+            }
+            if (m->mSlot < 0) {
+                unlockFile(fd);
+                m.reset();  // leaves again
+                return fail("sim room '" + room + "' is full (" + std::to_string(kSpeakerSlots) +
+                            " speakers)");
+            }
+        }
+        unlockFile(fd);
+        return m;
+    }
+    return fail("cannot join sim room '" + room + "': it keeps being removed");
+}
+
+RoomMembership::~RoomMembership() {
+    if (mFd < 0) return;
+    lockFile(mFd);
+    if (mMember >= 0) mLayout->header.members[mMember].store(0, std::memory_order_release);
+    if (mSlot >= 0) mLayout->slots[mSlot].owner.store(0, std::memory_order_release);
+    if (forgetDeparted(*mLayout) == 0 && stillNamed(mFd, mObjectName)) {
+        shm_unlink(mObjectName.c_str());
+    }
+    unmapLayout(mLayout);
+    close(mFd);  // drops the lock
+}
+
+}  // namespace sim
+}  // namespace platform
+}  // namespace korvo

@@ -1,0 +1,26 @@
+#!/usr/bin/env bash
+# Installs what is missing, builds and runs the whole suite: the default
+# (RelWithDebInfo) build, then the ASan+UBSan and TSan builds.
+#   scripts/test.sh             all three
+#   scripts/test.sh default     one preset (default, asan, tsan or clang)
+set -euo pipefail
+cd "$(dirname "$0")/.."
+
+scripts/install-deps.sh
+
+presets=("$@")
+if [ ${#presets[@]} -eq 0 ]; then
+  presets=(default asan tsan)
+fi
+
+status=0
+for preset in "${presets[@]}"; do
+  echo "==== ${preset}: configure and build"
+  cmake --preset "$preset" >/dev/null
+  cmake --build --preset "$preset"
+  echo "==== ${preset}: test"
+  if ! ctest --preset "$preset"; then
+    status=1
+  fi
+done
+exit $status

@@ -1,0 +1,305 @@
+// The platform log: line format, priorities, destinations, capture and whole lines under
+// concurrent writers.
+#include <gtest/gtest.h>
+
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <fstream>
+#include <set>
+#include <sstream>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <korvo/platform/Log.h>
+#include <korvo/platform/TestControl.h>
+#include <log/log.h>
+
+extern char** environ;
+
+namespace {
+
+namespace test = korvo::platform::test;
+
+std::string readFile(const std::string& path) {
+    std::ifstream in(path, std::ios::binary);
+    std::stringstream ss;
+    ss << in.rdbuf();
+    return ss.str();
+}
+
+std::string tempPath(const char* name) {
+    return "/tmp/korvo-log-" + std::to_string(getpid()) + "-" + name;
+}
+
+// Sends this process's stderr to a file while alive.
+class StderrToFile {
+public:
+    explicit StderrToFile(const std::string& path) : mPath(path) {
+        fflush(stderr);
+        mSaved = dup(STDERR_FILENO);
+        const int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
+        dup2(fd, STDERR_FILENO);
+        close(fd);
+    }
+    ~StderrToFile() { restore(); }
+    std::string finish() {
+        restore();
+        return readFile(mPath);
+    }
+
+private:
+    void restore() {
+        if (mSaved < 0) return;
+        fflush(stderr);
+        dup2(mSaved, STDERR_FILENO);
+        close(mSaved);
+        mSaved = -1;
+    }
+    std::string mPath;
+    int mSaved = -1;
+};
+
+void setEnv(const char* name, const char* value) {
+    if (value) {
+        setenv(name, value, 1);
+    } else {
+        unsetenv(name);
+    }
+}
+
+class LogTest : public ::testing::Test {
+protected:
+    void SetUp() override { test::resetAll(); }
+    void TearDown() override {
+        unsetenv("KORVO_LOG");
+        unsetenv("KORVO_LOG_LEVEL");
+        korvo::platform::reloadLogConfig();
+        for (const auto& p : mFiles) unlink(p.c_str());
+    }
+    std::string file(const char* name) {
+        mFiles.push_back(tempPath(name));
+        unlink(mFiles.back().c_str());
+        return mFiles.back();
+    }
+    std::vector<std::string> mFiles;
+};
+
+}  // namespace
+
+TEST_F(LogTest, LineFormatAndPriorityLetters) {
+    const std::string path = file("format.log");
+    korvo::platform::setLogTarget(path, 'V');
+    __android_log_print(ANDROID_LOG_DEBUG, "TQX", "[%s] AudioRecord preparation %d\n", "SoundMeter", 200);
+    __android_log_print(ANDROID_LOG_VERBOSE, "TQX", "v");
+    __android_log_print(ANDROID_LOG_INFO, "TQX", "i\n\n\n");
+    __android_log_print(ANDROID_LOG_WARN, "MiniToneGenerator", "two\nlines\n");
+    __android_log_print(ANDROID_LOG_ERROR, "TQX", "[%s] detection Level is %d\n", "WAVEFORM_CANVAS", -5);
+    __android_log_print(ANDROID_LOG_FATAL, "KeyedVector", "%s", "");
+    __android_log_print(ANDROID_LOG_DEFAULT, "T", "below verbose");
+    __android_log_print(ANDROID_LOG_DEBUG, "TQX", "[%s] Audio read failed rror = %d", "SoundMeter", -16);
+    EXPECT_EQ(readFile(path),
+              "D/TQX: [SoundMeter] AudioRecord preparation 200\n"
+              "V/TQX: v\n"
+              "I/TQX: i\n"
+              "W/MiniToneGenerator: two\nlines\n"
+              "E/TQX: [WAVEFORM_CANVAS] detection Level is -5\n"
+              "F/KeyedVector: \n"
+              "V/T: below verbose\n"
+              "D/TQX: [SoundMeter] Audio read failed rror = -16\n");
+}
+
+TEST_F(LogTest, LongLinesStayWhole) {
+    const std::string path = file("long.log");
+    korvo::platform::setLogTarget(path, 'D');
+    const std::string tag(1500, 't');
+    const std::string msg(5000, 'm');
+    __android_log_print(ANDROID_LOG_DEBUG, tag.c_str(), "%s|%d\n", msg.c_str(), 42);
+    __android_log_print(ANDROID_LOG_DEBUG, "T", "%s", std::string(1014, 'x').c_str());  // fills the line buffer
+    EXPECT_EQ(readFile(path), "D/" + tag + ": " + msg + "|42\n" + "D/T: " + std::string(1014, 'x') + "\n");
+}
+
+TEST_F(LogTest, LevelsFilesAndOffFromTheEnvironment) {
+    const std::string path = file("env.log");
+    struct Case {
+        const char* level;
+        const char* expected;
+    };
+    const Case cases[] = {
+        {nullptr, "D/T: d\nI/T: i\nW/T: w\nE/T: e\nF/T: f\n"},  // KORVO_LOG alone: from D on
+        {"V", "V/T: v\nD/T: d\nI/T: i\nW/T: w\nE/T: e\nF/T: f\n"},
+        {"D", "D/T: d\nI/T: i\nW/T: w\nE/T: e\nF/T: f\n"},
+        {"I", "I/T: i\nW/T: w\nE/T: e\nF/T: f\n"},
+        {"W", "W/T: w\nE/T: e\nF/T: f\n"},
+        {"E", "E/T: e\nF/T: f\n"},
+    };
+    for (const Case& c : cases) {
+        unlink(path.c_str());
+        setEnv("KORVO_LOG", path.c_str());
+        setEnv("KORVO_LOG_LEVEL", c.level);
+        korvo::platform::reloadLogConfig();
+        for (int p = ANDROID_LOG_VERBOSE; p <= ANDROID_LOG_FATAL; ++p) {
+            const char letter[] = {"vdiwef"[p - ANDROID_LOG_VERBOSE], '\0'};
+            __android_log_print(p, "T", "%s", letter);
+        }
+        EXPECT_EQ(readFile(path), c.expected) << "level " << (c.level ? c.level : "(unset)");
+    }
+
+    // The file is appended to, never truncated.
+    korvo::platform::reloadLogConfig();
+    __android_log_print(ANDROID_LOG_ERROR, "T", "again");
+    EXPECT_EQ(readFile(path), "E/T: e\nF/T: f\nE/T: again\n");
+
+    // off writes nothing, whatever the level.
+    unlink(path.c_str());
+    setEnv("KORVO_LOG", "off");
+    setEnv("KORVO_LOG_LEVEL", "V");
+    korvo::platform::reloadLogConfig();
+    __android_log_print(ANDROID_LOG_FATAL, "T", "nothing");
+    EXPECT_NE(access(path.c_str(), F_OK), 0);
+}
+
+TEST_F(LogTest, StderrTargets) {
+    struct Case {
+        const char* log;
+        const char* level;
+        const char* expected;
+    };
+    const Case cases[] = {
+        {nullptr, nullptr, ""},  // the default: silent
+        {"", "", ""},
+        {"stderr", nullptr, "D/S: d\nE/S: e\n"},
+        {nullptr, "W", "E/S: e\n"},  // a level alone means stderr
+        {"stderr", "V", "V/S: v\nD/S: d\nE/S: e\n"},
+        {"off", "V", ""},
+    };
+    for (const Case& c : cases) {
+        setEnv("KORVO_LOG", c.log);
+        setEnv("KORVO_LOG_LEVEL", c.level);
+        korvo::platform::reloadLogConfig();
+        StderrToFile capture(file("stderr.txt"));
+        __android_log_print(ANDROID_LOG_VERBOSE, "S", "v");
+        __android_log_print(ANDROID_LOG_DEBUG, "S", "d\n");
+        __android_log_print(ANDROID_LOG_ERROR, "S", "e");
+        EXPECT_EQ(capture.finish(), c.expected)
+            << "KORVO_LOG=" << (c.log ? c.log : "(unset)") << " KORVO_LOG_LEVEL=" << (c.level ? c.level : "(unset)");
+    }
+
+    // A log file that cannot be opened is reported once on stderr; the log stays off.
+    setEnv("KORVO_LOG", "/nonexistent-korvo-dir/x.log");
+    setEnv("KORVO_LOG_LEVEL", nullptr);
+    StderrToFile capture(file("stderr-bad.txt"));
+    korvo::platform::reloadLogConfig();
+    __android_log_print(ANDROID_LOG_ERROR, "S", "lost");
+    const std::string err = capture.finish();
+    EXPECT_EQ(err.find("lost"), std::string::npos);
+    EXPECT_NE(err.find("/nonexistent-korvo-dir/x.log"), std::string::npos);
+    EXPECT_EQ(std::count(err.begin(), err.end(), '\n'), 1);
+}
+
+TEST_F(LogTest, CaptureKeepsEveryLine) {
+    korvo::platform::setLogTarget("off", 'E');
+    __android_log_print(ANDROID_LOG_DEBUG, "TQX", "before capture");
+    test::captureLog(true);
+    __android_log_print(ANDROID_LOG_VERBOSE, "TQX", "[%s] android_media_AudioRecord_get_min_buff_size(%d, %d, %d)",
+                        "SoundMeter", 44100, 1, 2);
+    __android_log_print(ANDROID_LOG_ERROR, "MiniToneGenerator", "trail\n\n");
+    __android_log_print(ANDROID_LOG_DEBUG, "TQX", "a\nb\n");
+    auto lines = test::logLines();
+    ASSERT_EQ(lines.size(), 3u);
+    EXPECT_EQ(lines[0].prio, ANDROID_LOG_VERBOSE);
+    EXPECT_EQ(lines[0].tag, "TQX");
+    EXPECT_EQ(lines[0].msg, "[SoundMeter] android_media_AudioRecord_get_min_buff_size(44100, 1, 2)");
+    EXPECT_EQ(lines[1].prio, ANDROID_LOG_ERROR);
+    EXPECT_EQ(lines[1].tag, "MiniToneGenerator");
+    EXPECT_EQ(lines[1].msg, "trail");
+    EXPECT_EQ(lines[2].msg, "a\nb");
+    test::clearLog();
+    EXPECT_TRUE(test::logLines().empty());
+    test::captureLog(false);
+    __android_log_print(ANDROID_LOG_ERROR, "TQX", "not kept");
+    EXPECT_TRUE(test::logLines().empty());
+    test::captureLog(true);
+    test::resetAll();  // capture off and emptied
+    __android_log_print(ANDROID_LOG_ERROR, "TQX", "not kept either");
+    EXPECT_TRUE(test::logLines().empty());
+}
+
+TEST_F(LogTest, ConcurrentWritersNeverInterleave) {
+    const std::string path = file("threads.log");
+    korvo::platform::setLogTarget(path, 'D');
+    test::captureLog(true);
+    constexpr int kThreads = 6;
+    constexpr int kLines = 400;
+    std::vector<std::thread> threads;
+    for (int t = 0; t < kThreads; ++t) {
+        threads.emplace_back([t] {
+            // Some lines are longer than the stack buffer, to take the other path too.
+            const std::string pad(t % 2 ? 1500 : 20, static_cast<char>('a' + t));
+            for (int i = 0; i < kLines; ++i) {
+                __android_log_print(ANDROID_LOG_DEBUG, "W", "thread %d line %d %s\n", t, i, pad.c_str());
+            }
+        });
+    }
+    for (auto& th : threads) th.join();
+    std::set<std::string> expected;
+    for (int t = 0; t < kThreads; ++t) {
+        const std::string pad(t % 2 ? 1500 : 20, static_cast<char>('a' + t));
+        for (int i = 0; i < kLines; ++i) {
+            expected.insert("D/W: thread " + std::to_string(t) + " line " + std::to_string(i) + " " + pad);
+        }
+    }
+    std::istringstream in(readFile(path));
+    std::string line;
+    std::set<std::string> seen;
+    int count = 0;
+    while (std::getline(in, line)) {
+        ++count;
+        EXPECT_EQ(expected.count(line), 1u) << line.substr(0, 80);
+        seen.insert(line);
+    }
+    EXPECT_EQ(count, kThreads * kLines);
+    EXPECT_EQ(seen.size(), expected.size());
+    EXPECT_EQ(test::logLines().size(), static_cast<size_t>(kThreads * kLines));
+}
+
+// Child half of the next test: logs with whatever environment it was started with.
+TEST(LogChild, WritesWithItsEnvironment) {
+    if (!std::getenv("KORVO_LOG_CHILD")) GTEST_SKIP() << "run by ReadsTheEnvironmentAtTheFirstCall";
+    __android_log_print(ANDROID_LOG_VERBOSE, "C", "v");
+    __android_log_print(ANDROID_LOG_INFO, "C", "first %d", 1);
+    setenv("KORVO_LOG", "off", 1);  // read once: later changes need reloadLogConfig
+    __android_log_print(ANDROID_LOG_INFO, "C", "second");
+}
+
+TEST_F(LogTest, ReadsTheEnvironmentAtTheFirstCall) {
+    const std::string path = file("child.log");
+    const std::string logEnv = "KORVO_LOG=" + path;
+    std::vector<std::string> env = {logEnv, "KORVO_LOG_LEVEL=I", "KORVO_LOG_CHILD=1"};
+    for (char** e = environ; *e; ++e) {
+        const std::string s(*e);
+        if (s.rfind("KORVO_LOG", 0) != 0 && s.rfind("GTEST_", 0) != 0) env.push_back(s);
+    }
+    std::vector<char*> envp;
+    for (auto& s : env) envp.push_back(&s[0]);
+    envp.push_back(nullptr);
+    std::string self = "/proc/self/exe";
+    std::string filter = "--gtest_filter=LogChild.WritesWithItsEnvironment";
+    char* argv[] = {&self[0], &filter[0], nullptr};
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
+    pid_t pid = 0;
+    ASSERT_EQ(posix_spawn(&pid, self.c_str(), &actions, nullptr, argv, envp.data()), 0);
+    posix_spawn_file_actions_destroy(&actions);
+    int status = 0;
+    ASSERT_EQ(waitpid(pid, &status, 0), pid);
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 0);
+    EXPECT_EQ(readFile(path), "I/C: first 1\nI/C: second\n");
+}

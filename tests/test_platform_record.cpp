@@ -1,0 +1,349 @@
+// The capture stream: configuration, the scripted microphone, stop against a blocked read,
+// the null route's real-time pace and a WAV file heard through the stream.
+#include <gtest/gtest.h>
+
+#include <sndfile.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <chrono>
+#include <cstdlib>
+#include <future>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <korvo/platform/TestControl.h>
+#include <log/log.h>
+#include <media/AudioRecord.h>
+#include <utils/Timers.h>
+
+using namespace android;
+
+namespace {
+
+namespace test = korvo::platform::test;
+
+template <typename Pred>
+bool waitUntil(Pred pred, int timeoutMs = 5000) {
+    const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
+    while (!pred()) {
+        if (std::chrono::steady_clock::now() > end) return false;
+        std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    }
+    return true;
+}
+
+sp<AudioRecord> makeRecord(size_t frameCount = 0) {
+    sp<AudioRecord> r = new AudioRecord(String16());
+    r->set(AUDIO_SOURCE_MIC, 44100, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_MONO, frameCount, nullptr,
+           nullptr, 0, false, AUDIO_SESSION_ALLOCATE, AudioRecord::TRANSFER_SYNC, AUDIO_INPUT_FLAG_NONE, -1, -1,
+           nullptr);
+    return r;
+}
+
+std::vector<int16_t> ramp(size_t n, int start) {
+    std::vector<int16_t> v(n);
+    for (size_t i = 0; i < n; ++i) v[i] = static_cast<int16_t>(start + static_cast<int>(i) * 7);
+    return v;
+}
+
+class RecordTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        test::resetAll();
+        unsetenv("KORVO_MIC");
+    }
+    void TearDown() override {
+        test::resetAll();
+        unsetenv("KORVO_MIC");
+        for (const auto& p : mFiles) unlink(p.c_str());
+    }
+    std::string file(const char* name) {
+        mFiles.push_back("/tmp/korvo-record-" + std::to_string(getpid()) + "-" + name);
+        return mFiles.back();
+    }
+    std::vector<std::string> mFiles;
+};
+
+}  // namespace
+
+TEST_F(RecordTest, MinFrameCountAndConfiguration) {
+    size_t frames = 0;
+    EXPECT_EQ(AudioRecord::getMinFrameCount(&frames, 44100, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_MONO), OK);
+    EXPECT_EQ(frames, 1024u);
+    test::setMinFrameCount(300);
+    EXPECT_EQ(AudioRecord::getMinFrameCount(&frames, 8000, AUDIO_FORMAT_AMR_WB, 0x8000003Fu), OK);
+    EXPECT_EQ(frames, 300u);
+    test::failMinFrameCount(-EIO);
+    frames = 77;
+    EXPECT_EQ(AudioRecord::getMinFrameCount(&frames, 44100, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_MONO), -EIO);
+    EXPECT_EQ(frames, 77u);
+    EXPECT_EQ(AudioRecord::getMinFrameCount(nullptr, 44100, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_MONO), BAD_VALUE);
+    test::resetAll();
+
+    sp<AudioRecord> unset = new AudioRecord(String16());
+    EXPECT_EQ(unset->initCheck(), NO_INIT);
+    int16_t buf[8];
+    EXPECT_EQ(unset->read(buf, sizeof(buf), true), NO_INIT);
+    EXPECT_EQ(unset->start(), NO_INIT);
+
+    sp<AudioRecord> r = makeRecord(0);  // 0: the platform minimum
+    EXPECT_EQ(r->initCheck(), OK);
+    EXPECT_EQ(r->frameCount(), 1024u);
+    EXPECT_EQ(r->frameSize(), 2u);
+    EXPECT_EQ(r->getSampleRate(), 44100u);
+    EXPECT_TRUE(r->stopped());
+    EXPECT_EQ(r->set(AUDIO_SOURCE_MIC, 44100, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_MONO), INVALID_OPERATION);
+    sp<AudioRecord> big = makeRecord(2048);
+    EXPECT_EQ(big->frameCount(), 2048u);
+
+    // Only 16-bit mono is delivered.
+    sp<AudioRecord> stereo = new AudioRecord(String16());
+    EXPECT_EQ(stereo->set(AUDIO_SOURCE_MIC, 44100, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_STEREO), BAD_VALUE);
+    EXPECT_EQ(stereo->initCheck(), BAD_VALUE);
+    EXPECT_EQ(stereo->frameSize(), 4u);
+
+    // The minimum is looked up when the frame count is 0 and may fail.
+    test::failMinFrameCount(-EIO);
+    sp<AudioRecord> failing = makeRecord(0);
+    EXPECT_EQ(failing->initCheck(), -EIO);
+}
+
+TEST_F(RecordTest, BadRouteTextMakesTheStreamUnusable) {
+    setenv("KORVO_MIC", "foo", 1);
+    test::captureLog(true);
+    sp<AudioRecord> r = new AudioRecord(String16());
+    EXPECT_EQ(r->set(AUDIO_SOURCE_MIC, 44100, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_MONO, 1024), NO_INIT);
+    EXPECT_EQ(r->initCheck(), NO_INIT);
+    const auto lines = test::logLines();
+    ASSERT_EQ(lines.size(), 1u);
+    EXPECT_EQ(lines[0].prio, ANDROID_LOG_ERROR);
+    EXPECT_EQ(lines[0].tag, "AudioRecord");
+    EXPECT_NE(lines[0].msg.find("unknown audio route 'foo' (expected null, wav:PATH, sim:ROOM or card[:DEVICE])"),
+              std::string::npos);
+    EXPECT_EQ(r->start(), NO_INIT);
+    int16_t buf[16];
+    test::scriptMic(true);  // even a script does not revive it
+    EXPECT_EQ(r->read(buf, sizeof(buf), true), NO_INIT);
+
+    setenv("KORVO_MIC", "wav:/nonexistent-korvo-dir/none.wav", 1);
+    test::clearLog();
+    sp<AudioRecord> missing = makeRecord();
+    EXPECT_EQ(missing->initCheck(), NO_INIT);
+    ASSERT_EQ(test::logLines().size(), 1u);
+    EXPECT_NE(test::logLines()[0].msg.find("cannot read WAV file"), std::string::npos);
+}
+
+TEST_F(RecordTest, ReadsOutsideAStartedStream) {
+    test::scriptMic(true);
+    int16_t in[4] = {1, 2, 3, 4};
+    test::pushMicSamples(in, 4);
+    sp<AudioRecord> r = makeRecord();
+    int16_t buf[4] = {};
+    EXPECT_EQ(r->read(buf, sizeof(buf), true), 0);  // never started
+    EXPECT_EQ(r->read(buf, sizeof(buf), false), INVALID_OPERATION);
+    EXPECT_EQ(r->read(nullptr, 8, true), BAD_VALUE);
+    ASSERT_EQ(r->start(), OK);
+    EXPECT_FALSE(r->stopped());
+    alignas(int16_t) char bytes[16];
+    EXPECT_EQ(r->read(bytes + 1, 8, true), BAD_VALUE);  // not on a sample boundary
+    r->stop();
+    EXPECT_TRUE(r->stopped());
+    EXPECT_EQ(r->read(buf, sizeof(buf), true), 0);  // stopped
+    EXPECT_EQ(test::micSamplesQueued(), 4u);
+    ASSERT_EQ(r->start(), OK);  // a second start resumes
+    EXPECT_EQ(r->read(buf, sizeof(buf), true), 8);
+    EXPECT_EQ(buf[3], 4);
+}
+
+TEST_F(RecordTest, ScriptedMicrophone) {
+    test::scriptMic(true);
+    sp<AudioRecord> r = makeRecord();
+    ASSERT_EQ(r->start(), OK);
+    EXPECT_EQ(test::lastMicReadRequest(), 0u);
+
+    // Whole frames.
+    const auto frame = ramp(512, -1000);
+    test::pushMicSamples(frame.data(), frame.size());
+    std::vector<int16_t> buf(512, 0);
+    EXPECT_EQ(r->read(buf.data(), 1024, true), 1024);
+    EXPECT_EQ(buf, frame);
+    EXPECT_EQ(test::lastMicReadRequest(), 1024u);
+
+    // A short count takes only that much; the rest waits for the next read.
+    test::pushMicResult(600);
+    test::pushMicSamples(frame.data(), frame.size());
+    std::fill(buf.begin(), buf.end(), 0);
+    EXPECT_EQ(r->read(buf.data(), 1024, true), 600);
+    EXPECT_TRUE(std::equal(frame.begin(), frame.begin() + 300, buf.begin()));
+    EXPECT_EQ(buf[300], 0);
+    EXPECT_EQ(test::micSamplesQueued(), 212u);
+    EXPECT_EQ(r->read(buf.data() + 300, 424, true), 424);
+    EXPECT_EQ(test::lastMicReadRequest(), 424u);
+    EXPECT_EQ(buf, frame);
+    EXPECT_EQ(test::micSamplesQueued(), 0u);
+
+    // A result larger than the request delivers the request; an odd one whole samples.
+    test::pushMicResult(5000);
+    test::pushMicResult(7);
+    test::pushMicSamples(frame.data(), 20);
+    EXPECT_EQ(r->read(buf.data(), 20, true), 20);
+    EXPECT_EQ(r->read(buf.data(), 20, true), 6);
+    EXPECT_EQ(test::micSamplesQueued(), 7u);
+
+    // 0 and negative statuses come back as they are and consume nothing.
+    test::pushMicResult(0);
+    test::pushMicResult(-32);
+    test::pushMicResult(NO_INIT);
+    EXPECT_EQ(r->read(buf.data(), 1024, true), 0);
+    EXPECT_EQ(r->read(buf.data(), 1024, true), -32);
+    EXPECT_EQ(r->read(buf.data(), 1024, true), NO_INIT);
+    EXPECT_EQ(test::micSamplesQueued(), 7u);
+}
+
+TEST_F(RecordTest, BlockedReadWaitsForSamplesAndStop) {
+    test::scriptMic(true);
+    sp<AudioRecord> r = makeRecord();
+    ASSERT_EQ(r->start(), OK);
+    const auto frame = ramp(512, 5);
+
+    // Blocked until the whole request is queued.
+    std::vector<int16_t> buf(512, 0);
+    auto reader = std::async(std::launch::async, [&] { return r->read(buf.data(), 1024, true); });
+    ASSERT_TRUE(waitUntil([] { return test::micReadersWaiting() == 1; }));
+    test::pushMicSamples(frame.data(), 100);
+    test::pushMicSamples(frame.data() + 100, 412);
+    EXPECT_EQ(reader.get(), 1024);
+    EXPECT_EQ(buf, frame);
+    EXPECT_EQ(test::micReadersWaiting(), 0);
+
+    // A queued short count waits for its own size only.
+    test::pushMicResult(200);
+    auto shortReader = std::async(std::launch::async, [&] { return r->read(buf.data(), 1024, true); });
+    ASSERT_TRUE(waitUntil([] { return test::micReadersWaiting() == 1; }));
+    test::pushMicSamples(frame.data(), 100);
+    EXPECT_EQ(shortReader.get(), 200);
+
+    // stop() from another thread ends a blocked read with nothing.
+    auto stopped = std::async(std::launch::async, [&] { return r->read(buf.data(), 1024, true); });
+    ASSERT_TRUE(waitUntil([] { return test::micReadersWaiting() == 1; }));
+    r->stop();
+    EXPECT_EQ(stopped.get(), 0);
+
+    // ... or with what had arrived.
+    ASSERT_EQ(r->start(), OK);
+    test::pushMicSamples(frame.data(), 30);
+    auto partial = std::async(std::launch::async, [&] { return r->read(buf.data(), 1024, true); });
+    ASSERT_TRUE(waitUntil([] { return test::micReadersWaiting() == 1; }));
+    r->stop();
+    EXPECT_EQ(partial.get(), 60);
+
+    // Switching the script off (resetAll in a test's SetUp) releases a reader too.
+    ASSERT_EQ(r->start(), OK);
+    auto released = std::async(std::launch::async, [&] { return r->read(buf.data(), 1024, true); });
+    ASSERT_TRUE(waitUntil([] { return test::micReadersWaiting() == 1; }));
+    test::resetAll();
+    EXPECT_EQ(released.get(), 0);
+}
+
+TEST_F(RecordTest, StopRacesReadsOnTheNullRoute) {
+    sp<AudioRecord> r = makeRecord();
+    for (int round = 0; round < 20; ++round) {
+        ASSERT_EQ(r->start(), OK);
+        std::atomic<bool> reading{false};
+        std::vector<int16_t> buf(44100, 1);
+        auto reader = std::async(std::launch::async, [&] {
+            reading = true;
+            return r->read(buf.data(), buf.size() * 2, true);  // one second unless stopped
+        });
+        ASSERT_TRUE(waitUntil([&] { return reading.load(); }));
+        if (round % 2) std::this_thread::sleep_for(std::chrono::milliseconds(2));  // vary the race
+        r->stop();
+        const ssize_t got = reader.get();
+        EXPECT_GE(got, 0);
+        EXPECT_LT(got, static_cast<ssize_t>(buf.size() * 2));
+        EXPECT_EQ(got % 2, 0);
+        for (ssize_t i = 0; i < got / 2; ++i) ASSERT_EQ(buf[static_cast<size_t>(i)], 0);
+    }
+}
+
+TEST_F(RecordTest, NullRouteDeliversSilenceAtRealTimePace) {
+    sp<AudioRecord> r = makeRecord();
+    std::vector<int16_t> buf(4410, 123);
+    const nsecs_t t0 = systemTime(SYSTEM_TIME_MONOTONIC);
+    ASSERT_EQ(r->start(), OK);
+    EXPECT_EQ(r->read(buf.data(), buf.size() * 2, true), 8820);
+    const nsecs_t t1 = systemTime(SYSTEM_TIME_MONOTONIC);
+    EXPECT_GE(t1 - t0, 100000000);  // 4410 samples are 100 ms of sound: never sooner
+    for (int16_t s : buf) ASSERT_EQ(s, 0);
+
+    // Small reads add up to the same pace.
+    for (int i = 0; i < 10; ++i) ASSERT_EQ(r->read(buf.data(), 882, true), 882);
+    EXPECT_GE(systemTime(SYSTEM_TIME_MONOTONIC) - t0, 200000000);
+}
+
+TEST_F(RecordTest, WavFileHeardThroughTheStream) {
+    const std::string path = file("mic.wav");
+    std::vector<int16_t> samples(3000);
+    for (size_t i = 0; i < samples.size(); ++i) samples[i] = static_cast<int16_t>((i * 2654435761u) >> 16);
+    {
+        SF_INFO info{};
+        info.samplerate = 44100;
+        info.channels = 1;
+        info.format = SF_FORMAT_WAV | SF_FORMAT_PCM_16;
+        SNDFILE* f = sf_open(path.c_str(), SFM_WRITE, &info);
+        ASSERT_NE(f, nullptr);
+        ASSERT_EQ(sf_writef_short(f, samples.data(), static_cast<sf_count_t>(samples.size())), 3000);
+        sf_close(f);
+    }
+    setenv("KORVO_MIC", ("wav:" + path).c_str(), 1);
+    test::captureLog(true);
+    sp<AudioRecord> r = makeRecord();
+    ASSERT_EQ(r->initCheck(), OK);
+    ASSERT_EQ(r->start(), OK);
+    std::vector<int16_t> heard(4000, 1);
+    ASSERT_EQ(r->read(heard.data(), 2000 * 2, true), 4000);
+    r->stop();  // a pause in the middle resumes where the file was
+    ASSERT_EQ(r->start(), OK);
+    ASSERT_EQ(r->read(heard.data() + 2000, 2000 * 2, true), 4000);
+    EXPECT_TRUE(std::equal(samples.begin(), samples.end(), heard.begin()));
+    for (size_t i = 3000; i < 4000; ++i) ASSERT_EQ(heard[i], 0) << i;  // then silence
+    EXPECT_TRUE(test::logLines().empty());
+}
+
+TEST_F(RecordTest, WavFileWithAnotherRateAndChannels) {
+    const std::string path = file("stereo48k.wav");
+    std::vector<int16_t> frames(2 * 500);
+    for (size_t i = 0; i < 500; ++i) {
+        frames[2 * i] = static_cast<int16_t>(i * 13);
+        frames[2 * i + 1] = -1;
+    }
+    {
+        SF_INFO info{};
+        info.samplerate = 48000;
+        info.channels = 2;
+        info.format = SF_FORMAT_WAV | SF_FORMAT_PCM_16;
+        SNDFILE* f = sf_open(path.c_str(), SFM_WRITE, &info);
+        ASSERT_NE(f, nullptr);
+        sf_writef_short(f, frames.data(), 500);
+        sf_close(f);
+    }
+    setenv("KORVO_MIC", ("wav:" + path).c_str(), 1);
+    test::captureLog(true);
+    sp<AudioRecord> r = makeRecord();
+    ASSERT_EQ(r->start(), OK);
+    std::vector<int16_t> heard(600, 1);
+    ASSERT_EQ(r->read(heard.data(), heard.size() * 2, true), 1200);
+    for (size_t i = 0; i < 500; ++i) ASSERT_EQ(heard[i], static_cast<int16_t>(i * 13)) << i;  // first channel
+    for (size_t i = 500; i < 600; ++i) ASSERT_EQ(heard[i], 0);
+    const auto lines = test::logLines();
+    int rateLines = 0;
+    for (const auto& l : lines) {
+        EXPECT_EQ(l.prio, ANDROID_LOG_ERROR);
+        EXPECT_EQ(l.msg.find('\n'), std::string::npos);
+        if (l.msg.find("48000 Hz") != std::string::npos && l.msg.find("rate differs") != std::string::npos) ++rateLines;
+    }
+    EXPECT_EQ(rateLines, 1);
+    EXPECT_EQ(lines.size(), 2u);  // the rate, and the channels
+}
