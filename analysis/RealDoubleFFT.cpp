@@ -22,7 +22,8 @@ Reader from(const WaveTable_Double& t, int off) {
 }
 
 // cc is (ido, l1, 2), ch is (ido, 2, l1).
-[[gnu::always_inline]] inline void radf2Body(int ido, int l1, Reader cc, double* ch, Reader wa1) {
+template <typename R>
+void radf2Body(int ido, int l1, R cc, double* ch, R wa1) {
     const int s = l1 * ido;  // distance between the two inputs
     for (int k = 0; k < l1; ++k) {
         const int a0 = k * ido, a1 = a0 + s;
@@ -61,8 +62,8 @@ Reader from(const WaveTable_Double& t, int off) {
 }
 
 // cc is (ido, l1, 3), ch is (ido, 3, l1).
-[[gnu::always_inline]] inline void radf3Body(int ido, int l1, Reader cc, double* ch, Reader wa1,
-                                           Reader wa2) {
+template <typename R>
+void radf3Body(int ido, int l1, R cc, double* ch, R wa1, R wa2) {
     constexpr double taur = -0.5;
     constexpr double taui = 0.866025403784439;
     auto CC = [&](int i, int k, int j) { return cc[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
@@ -99,8 +100,8 @@ Reader from(const WaveTable_Double& t, int off) {
 }
 
 // cc is (ido, l1, 4), ch is (ido, 4, l1).
-[[gnu::always_inline]] inline void radf4Body(int ido, int l1, Reader cc, double* ch, Reader wa1,
-                                           Reader wa2, Reader wa3) {
+template <typename R>
+void radf4Body(int ido, int l1, R cc, double* ch, R wa1, R wa2, R wa3) {
     constexpr double hsqt2 = 0.7071067811865475;
     const int s = l1 * ido;  // distance between the four inputs
     for (int k = 0; k < l1; ++k) {
@@ -169,8 +170,8 @@ Reader from(const WaveTable_Double& t, int off) {
 }
 
 // cc is (ido, l1, 5), ch is (ido, 5, l1).
-[[gnu::always_inline]] inline void radf5Body(int ido, int l1, Reader cc, double* ch, Reader wa1,
-                                           Reader wa2, Reader wa3, Reader wa4) {
+template <typename R>
+void radf5Body(int ido, int l1, R cc, double* ch, R wa1, R wa2, R wa3, R wa4) {
     constexpr double tr11 = 0.309016994374947;
     constexpr double ti11 = 0.951056516295154;
     constexpr double tr12 = -0.809016994374947;
@@ -234,8 +235,8 @@ Reader from(const WaveTable_Double& t, int off) {
 // General odd factor ip. The main table c is seen as cc (ido, ip, l1), c1 (ido, l1, ip)
 // and c2 (idl1, ip); the second table h as ch (ido, l1, ip) and ch2 (idl1, ip). The input
 // is read from h when ido is 1 and from c otherwise; the result is left in c.
-[[gnu::always_inline]] inline void radfgBody(int ido, int ip, int l1, int idl1, Reader cr,
-                                             double* cw, Reader hr, double* hw, Reader wa) {
+template <typename R>
+void radfgBody(int ido, int ip, int l1, int idl1, R cr, double* cw, R hr, double* hw, R wa) {
     auto CCw = [&](int i, int j, int k) -> double& { return cw[(i - 1) + ido * ((j - 1) + ip * (k - 1))]; };
     auto C1 = [&](int i, int k, int j) { return cr[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
     auto C1w = [&](int i, int k, int j) -> double& { return cw[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
@@ -347,14 +348,21 @@ Reader from(const WaveTable_Double& t, int off) {
     }
 }
 
-// Each pass is compiled twice from the same body: once where every table it reads is
-// known to be non-empty, so that the guarded reads' error branch folds away, and once
-// as written for the (never expected) empty table.
+// Each pass tests the length of every table it reads once, on entry. When none is empty
+// the body runs with readers that skip the repeated test (the guarded read can only yield
+// the entry); otherwise it runs with the per-read guard and its ERROR lines.
 bool nonEmpty(const Reader& r) { return r.length >= 1; }
+
+// A table already found non-empty by the pass.
+struct TestedReader {
+    const double* data;
+    double operator[](int i) const { return data[i]; }
+};
+TestedReader tested(const Reader& r) { return TestedReader{r.data}; }
 
 void radf2(int ido, int l1, Reader cc, double* ch, Reader wa1) {
     if (nonEmpty(cc) && nonEmpty(wa1)) {
-        radf2Body(ido, l1, cc, ch, wa1);
+        radf2Body(ido, l1, tested(cc), ch, tested(wa1));
     } else {
         radf2Body(ido, l1, cc, ch, wa1);
     }
@@ -362,7 +370,7 @@ void radf2(int ido, int l1, Reader cc, double* ch, Reader wa1) {
 
 void radf3(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2) {
     if (nonEmpty(cc) && nonEmpty(wa1) && nonEmpty(wa2)) {
-        radf3Body(ido, l1, cc, ch, wa1, wa2);
+        radf3Body(ido, l1, tested(cc), ch, tested(wa1), tested(wa2));
     } else {
         radf3Body(ido, l1, cc, ch, wa1, wa2);
     }
@@ -370,7 +378,7 @@ void radf3(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2) {
 
 void radf4(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2, Reader wa3) {
     if (nonEmpty(cc) && nonEmpty(wa1) && nonEmpty(wa2) && nonEmpty(wa3)) {
-        radf4Body(ido, l1, cc, ch, wa1, wa2, wa3);
+        radf4Body(ido, l1, tested(cc), ch, tested(wa1), tested(wa2), tested(wa3));
     } else {
         radf4Body(ido, l1, cc, ch, wa1, wa2, wa3);
     }
@@ -379,7 +387,7 @@ void radf4(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2, Reade
 void radf5(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2, Reader wa3,
            Reader wa4) {
     if (nonEmpty(cc) && nonEmpty(wa1) && nonEmpty(wa2) && nonEmpty(wa3) && nonEmpty(wa4)) {
-        radf5Body(ido, l1, cc, ch, wa1, wa2, wa3, wa4);
+        radf5Body(ido, l1, tested(cc), ch, tested(wa1), tested(wa2), tested(wa3), tested(wa4));
     } else {
         radf5Body(ido, l1, cc, ch, wa1, wa2, wa3, wa4);
     }
@@ -391,7 +399,7 @@ void radfg(int ido, int ip, int l1, int idl1, WaveTable_Double& c, WaveTable_Dou
     const Reader cr = from(c, 0);
     const Reader hr = from(h, 0);
     if (nonEmpty(cr) && nonEmpty(hr) && nonEmpty(wa)) {
-        radfgBody(ido, ip, l1, idl1, cr, c.data, hr, h.data, wa);
+        radfgBody(ido, ip, l1, idl1, tested(cr), c.data, tested(hr), h.data, tested(wa));
     } else {
         radfgBody(ido, ip, l1, idl1, cr, c.data, hr, h.data, wa);
     }
