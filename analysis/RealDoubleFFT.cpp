@@ -67,7 +67,9 @@ void radf3Body(int ido, int l1, R cc, double* ch, R wa1, R wa2) {
     constexpr double taur = -0.5;
     constexpr double taui = 0.866025403784439;
     auto CC = [&](int i, int k, int j) { return cc[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
-    auto CH = [&](int i, int j, int k) -> double& { return ch[(i - 1) + ido * ((j - 1) + 3 * (k - 1))]; };
+    auto CH = [&](int i, int j, int k) -> double& {
+        return ch[(i - 1) + ido * ((j - 1) + 3 * (k - 1))];
+    };
     for (int k = 1; k <= l1; ++k) {
         const double cr2 = CC(1, k, 2) + CC(1, k, 3);
         CH(1, 1, k) = CC(1, k, 1) + cr2;
@@ -177,7 +179,9 @@ void radf5Body(int ido, int l1, R cc, double* ch, R wa1, R wa2, R wa3, R wa4) {
     constexpr double tr12 = -0.809016994374947;
     constexpr double ti12 = 0.587785252292473;
     auto CC = [&](int i, int k, int j) { return cc[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
-    auto CH = [&](int i, int j, int k) -> double& { return ch[(i - 1) + ido * ((j - 1) + 5 * (k - 1))]; };
+    auto CH = [&](int i, int j, int k) -> double& {
+        return ch[(i - 1) + ido * ((j - 1) + 5 * (k - 1))];
+    };
     for (int k = 1; k <= l1; ++k) {
         const double cr2 = CC(1, k, 5) + CC(1, k, 2);
         const double ci5 = CC(1, k, 5) - CC(1, k, 2);
@@ -237,13 +241,19 @@ void radf5Body(int ido, int l1, R cc, double* ch, R wa1, R wa2, R wa3, R wa4) {
 // is read from h when ido is 1 and from c otherwise; the result is left in c.
 template <typename R>
 void radfgBody(int ido, int ip, int l1, int idl1, R cr, double* cw, R hr, double* hw, R wa) {
-    auto CCw = [&](int i, int j, int k) -> double& { return cw[(i - 1) + ido * ((j - 1) + ip * (k - 1))]; };
+    auto CCw = [&](int i, int j, int k) -> double& {
+        return cw[(i - 1) + ido * ((j - 1) + ip * (k - 1))];
+    };
     auto C1 = [&](int i, int k, int j) { return cr[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
-    auto C1w = [&](int i, int k, int j) -> double& { return cw[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
+    auto C1w = [&](int i, int k, int j) -> double& {
+        return cw[(i - 1) + ido * ((k - 1) + l1 * (j - 1))];
+    };
     auto C2 = [&](int ik, int j) { return cr[(ik - 1) + idl1 * (j - 1)]; };
     auto C2w = [&](int ik, int j) -> double& { return cw[(ik - 1) + idl1 * (j - 1)]; };
     auto CH = [&](int i, int k, int j) { return hr[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
-    auto CHw = [&](int i, int k, int j) -> double& { return hw[(i - 1) + ido * ((k - 1) + l1 * (j - 1))]; };
+    auto CHw = [&](int i, int k, int j) -> double& {
+        return hw[(i - 1) + ido * ((k - 1) + l1 * (j - 1))];
+    };
     auto CH2 = [&](int ik, int j) { return hr[(ik - 1) + idl1 * (j - 1)]; };
     auto CH2w = [&](int ik, int j) -> double& { return hw[(ik - 1) + idl1 * (j - 1)]; };
     auto WA = [&](int m) { return wa[m - 1]; };
@@ -384,8 +394,7 @@ void radf4(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2, Reade
     }
 }
 
-void radf5(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2, Reader wa3,
-           Reader wa4) {
+void radf5(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2, Reader wa3, Reader wa4) {
     if (nonEmpty(cc) && nonEmpty(wa1) && nonEmpty(wa2) && nonEmpty(wa3) && nonEmpty(wa4)) {
         radf5Body(ido, l1, tested(cc), ch, tested(wa1), tested(wa2), tested(wa3), tested(wa4));
     } else {
@@ -394,8 +403,7 @@ void radf5(int ido, int l1, Reader cc, double* ch, Reader wa1, Reader wa2, Reade
 }
 
 // General odd factor; see radfgBody for the roles of the two tables.
-void radfg(int ido, int ip, int l1, int idl1, WaveTable_Double& c, WaveTable_Double& h,
-           Reader wa) {
+void radfg(int ido, int ip, int l1, int idl1, WaveTable_Double& c, WaveTable_Double& h, Reader wa) {
     const Reader cr = from(c, 0);
     const Reader hr = from(h, 0);
     if (nonEmpty(cr) && nonEmpty(hr) && nonEmpty(wa)) {

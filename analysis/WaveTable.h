@@ -8,7 +8,7 @@
 #include "interface/Export.h"
 
 // The read of an entry of an empty table: prints the ERROR line, yields -2222.0.
-double WaveTable_emptyRead();
+[[gnu::cold]] double WaveTable_emptyRead();
 
 // A table's entries seen through the guarded read. Hot loops take a local copy so
 // that the length test stays in a register instead of being reloaded per entry.

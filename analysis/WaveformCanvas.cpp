@@ -66,8 +66,8 @@ void WaveformCanvas::setActive(bool on) { active.store(on, std::memory_order_rel
 void WaveformCanvas::setDetectionLevel(int value) {
     detectionLevel.store(value, std::memory_order_relaxed);
     std::printf("[%s] detection Level is %d\n", "WAVEFORM_CANVAS", value);
-    __android_log_print(ANDROID_LOG_ERROR, "TQX", "[%s] detection Level is %d\n",
-                        "WAVEFORM_CANVAS", value);
+    __android_log_print(ANDROID_LOG_ERROR, "TQX", "[%s] detection Level is %d\n", "WAVEFORM_CANVAS",
+                        value);
 }
 
 int WaveformCanvas::getDetectionLevel() { return detectionLevel.load(std::memory_order_relaxed); }

@@ -96,9 +96,15 @@ TEST_F(RealFftTest, FactorOrderAndTableLayout) {
     const struct {
         int n;
         std::vector<int> factors;
-    } cases[] = {{512, {2, 4, 4, 4, 4}}, {8, {2, 4}},        {12, {4, 3}},
-                 {14, {2, 7}},           {1000, {2, 4, 5, 5, 5}}, {97, {97}},
-                 {210, {2, 3, 5, 7}},    {2, {2}},             {49, {7, 7}}};
+    } cases[] = {{512, {2, 4, 4, 4, 4}},
+                 {8, {2, 4}},
+                 {12, {4, 3}},
+                 {14, {2, 7}},
+                 {1000, {2, 4, 5, 5, 5}},
+                 {97, {97}},
+                 {210, {2, 3, 5, 7}},
+                 {2, {2}},
+                 {49, {7, 7}}};
     for (const auto& c : cases) {
         SCOPED_TRACE("n = " + std::to_string(c.n));
         RealDoubleFFT fft(c.n);
@@ -121,8 +127,11 @@ TEST_F(RealFftTest, FactorOrderAndTableLayout) {
     // n = 12 (4, 3): one pair per multiple of 2pi/12 at wa 0, 3 and 6; the 3 gets none.
     RealDoubleFFT twelve(12);
     const double a = 6.283185307179586 / 12;
-    const std::vector<double> want = {std::cos(a), std::sin(a), 0, std::cos(2 * a), std::sin(2 * a), 0,
-                                      std::cos(3 * a), std::sin(3 * a), 0, 0, 0, 0};
+    std::vector<double> want(12, 0.0);
+    for (int m = 1; m <= 3; ++m) {
+        want[3 * (m - 1)] = std::cos(m * a);
+        want[3 * (m - 1) + 1] = std::sin(m * a);
+    }
     EXPECT_EQ(std::vector<double>(twelve.wavetable->data + 12, twelve.wavetable->data + 24), want);
 }
 
@@ -227,11 +236,13 @@ TEST_F(RealFftTest, SystemArraycopy) {
     sp<WaveTable_Double> src = tableOf({1, 2, 3, 4, 5});
     sp<WaveTable_Double> dst = tableOf({9, 9, 9, 9, 9, 9});
     System_arraycopy(src, 1, dst, 2, 3);
-    EXPECT_EQ(std::vector<double>(dst->data, dst->data + 6), (std::vector<double>{9, 9, 2, 3, 4, 9}));
+    EXPECT_EQ(std::vector<double>(dst->data, dst->data + 6),
+              (std::vector<double>{9, 9, 2, 3, 4, 9}));
 
     System_arraycopy(src, 0, dst, 0, 0);
     System_arraycopy(src, 0, dst, 0, -3);
-    EXPECT_EQ(std::vector<double>(dst->data, dst->data + 6), (std::vector<double>{9, 9, 2, 3, 4, 9}));
+    EXPECT_EQ(std::vector<double>(dst->data, dst->data + 6),
+              (std::vector<double>{9, 9, 2, 3, 4, 9}));
 
     sp<WaveTable_Double> empty = new WaveTable_Double(0);
     testing::internal::CaptureStdout();

@@ -115,8 +115,10 @@ TEST_F(SpectrumAnalyserTest, SetInputConvertsOrRefuses) {
     ASSERT_EQ(lines.size(), 2u);
     EXPECT_EQ(lines[0].prio, 6);
     EXPECT_EQ(lines[0].tag, "TQX");
-    EXPECT_EQ(lines[0].msg, "[WAVEFORM_CANVAS] SpectrumAnalyser_setInput: bad input count(511) in FFT");
-    EXPECT_EQ(lines[1].msg, "[WAVEFORM_CANVAS] SpectrumAnalyser_setInput: bad input count(513) in FFT");
+    EXPECT_EQ(lines[0].msg,
+              "[WAVEFORM_CANVAS] SpectrumAnalyser_setInput: bad input count(511) in FFT");
+    EXPECT_EQ(lines[1].msg,
+              "[WAVEFORM_CANVAS] SpectrumAnalyser_setInput: bad input count(513) in FFT");
 }
 
 TEST_F(SpectrumAnalyserTest, DirectResultsIntoTablesOfOtherSizes) {
@@ -130,8 +132,10 @@ TEST_F(SpectrumAnalyserTest, DirectResultsIntoTablesOfOtherSizes) {
     EXPECT_NEAR(full->data[30], 128.0 / kDivisor, 1e-4);
     // Magnitude: |X_i| narrowed to single precision, then divided in single precision.
     const double a = fft->data[60], b = fft->data[59];
-    EXPECT_EQ(full->data[30], static_cast<double>(static_cast<float>(std::sqrt(a * a + b * b)) / 325.6832f));
-    EXPECT_EQ(full->data[0], static_cast<double>(static_cast<float>(std::fabs(fft->data[0])) / 325.6832f));
+    EXPECT_EQ(full->data[30],
+              static_cast<double>(static_cast<float>(std::sqrt(a * a + b * b)) / 325.6832f));
+    EXPECT_EQ(full->data[0],
+              static_cast<double>(static_cast<float>(std::fabs(fft->data[0])) / 325.6832f));
 
     // Shorter: logged, the entries that fit are written and nothing past the end.
     sp<WaveTable_Double> small = new WaveTable_Double(40);
@@ -147,8 +151,10 @@ TEST_F(SpectrumAnalyserTest, DirectResultsIntoTablesOfOtherSizes) {
     ASSERT_EQ(lines.size(), 2u);
     EXPECT_EQ(lines[0].prio, 6);
     EXPECT_EQ(lines[0].tag, "TQX");
-    EXPECT_EQ(lines[0].msg, "[WAVEFORM_CANVAS] bad output buffer size in FFT: must be 256; given 40");
-    EXPECT_EQ(lines[1].msg, "[WAVEFORM_CANVAS] bad output buffer size in FFT: must be 256; given 300");
+    EXPECT_EQ(lines[0].msg,
+              "[WAVEFORM_CANVAS] bad output buffer size in FFT: must be 256; given 40");
+    EXPECT_EQ(lines[1].msg,
+              "[WAVEFORM_CANVAS] bad output buffer size in FFT: must be 256; given 300");
 }
 
 TEST_F(SpectrumAnalyserTest, AveragingPathWithWidthThree) {
@@ -192,7 +198,8 @@ TEST_F(SpectrumAnalyserTest, AveragingPathWithWidthThree) {
     testing::internal::CaptureStdout();
     EXPECT_EQ(canvas->spectrumAnalyser_getResults(frames[0], average, history, index), 1);
     testing::internal::GetCapturedStdout();
-    EXPECT_NEAR(average->data[12], (static_cast<double>(mags[1][12]) + mags[2][12] + mags[0][12]) / 3.0, 1e-6);
+    EXPECT_NEAR(average->data[12],
+                (static_cast<double>(mags[1][12]) + mags[2][12] + mags[0][12]) / 3.0, 1e-6);
     EXPECT_TRUE(kt::logLines().empty());
 }
 
@@ -217,8 +224,10 @@ TEST_F(SpectrumAnalyserTest, AveragingPathRefusesWrongSizes) {
     ASSERT_EQ(lines.size(), 2u);
     EXPECT_EQ(lines[0].prio, 6);
     EXPECT_EQ(lines[0].tag, "TQX");
-    EXPECT_EQ(lines[0].msg, "[WAVEFORM_CANVAS] bad average buffer size in FFT: must be 256 ; given 255");
-    EXPECT_EQ(lines[1].msg, "[WAVEFORM_CANVAS] bad history buffer size in FFT: must be 256 ; given 10");
+    EXPECT_EQ(lines[0].msg,
+              "[WAVEFORM_CANVAS] bad average buffer size in FFT: must be 256 ; given 255");
+    EXPECT_EQ(lines[1].msg,
+              "[WAVEFORM_CANVAS] bad history buffer size in FFT: must be 256 ; given 10");
 
     // Index -1 (after a refusal) and indices outside the history start again at slot 0.
     testing::internal::CaptureStdout();
@@ -254,5 +263,6 @@ TEST_F(SpectrumAnalyserTest, DrawSpectrumThroughTheHistory) {
     testing::internal::GetCapturedStdout();
     const auto lines = kt::logLines();
     ASSERT_EQ(lines.size(), 1u);
-    EXPECT_EQ(lines[0].msg, "[WAVEFORM_CANVAS] bad average buffer size in FFT: must be 256 ; given 100");
+    EXPECT_EQ(lines[0].msg,
+              "[WAVEFORM_CANVAS] bad average buffer size in FFT: must be 256 ; given 100");
 }

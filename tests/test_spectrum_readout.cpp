@@ -87,13 +87,13 @@ TEST_F(SpectrumReadoutTest, ExactLevels) {
 
 TEST_F(SpectrumReadoutTest, ThresholdsAndCounting) {
     const double minusFive = std::pow(10.0, -6.3);
-    setBin(5, 1.0);                 // 100
-    setBin(6, 1e-3);                // exactly 50
-    setBin(7, 0.01);                // 66.66667
-    setBin(8, minusFive);           // about -5
+    setBin(5, 1.0);                   // 100
+    setBin(6, 1e-3);                  // exactly 50
+    setBin(7, 0.01);                  // 66.66667
+    setBin(8, minusFive);             // about -5
     setBin(9, std::pow(10.0, -4.5));  // 25
     setBin(10, std::nan(""));
-    setBin(11, HUGE_VAL);           // +infinity is not finite either
+    setBin(11, HUGE_VAL);  // +infinity is not finite either
 
     for (int level : {0, 50, -10}) {
         SCOPED_TRACE("threshold " + std::to_string(level));
@@ -101,7 +101,8 @@ TEST_F(SpectrumReadoutTest, ThresholdsAndCounting) {
         if (level != 0) canvas->setDetectionLevel(level);
         testing::internal::GetCapturedStdout();
         GuardedOut a;
-        EXPECT_EQ(canvas->getSpectrumData(a.out()), 4);  // bins 5, 6, 7 and 9 whatever the threshold
+        // Bins 5, 6, 7 and 9, whatever the threshold.
+        EXPECT_EQ(canvas->getSpectrumData(a.out()), 4);
         EXPECT_EQ(a[5], 100.0f);
         EXPECT_EQ(a[6], level < 50 ? 50.0f : 0.0f);
         EXPECT_EQ(a[7], 66.66667f);

@@ -141,7 +141,7 @@ TEST_F(ToneCallbackTest, LimitOfZeroMs) {
     // The first block is already past the limit while the tone is still starting:
     // a fade from the generator's initial state, and the state only moves to playing.
     ASSERT_TRUE(startAndPump(gen, 0, 0, &p));
-    EXPECT_TRUE(countMessage("MiniToneGenerator", "prepareWave, duration limited to 0 ms") == 1);
+    EXPECT_EQ(countMessage("MiniToneGenerator", "prepareWave, duration limited to 0 ms"), 1);
     EXPECT_EQ(p.samples, ref.block(882, STOP));
     EXPECT_EQ(stateOf(gen), MiniToneGenerator::TONE_PLAYING);
 

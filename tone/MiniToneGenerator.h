@@ -21,11 +21,11 @@ namespace android {
 
 class MiniToneGenerator {
 public:
-    static const unsigned int TONEGEN_INF = 0xFFFFFFFFu;
-    static const unsigned int TONE_CODE_END = 999;
-    static const int FREQ_CODE_END = 99999;
-    static const int NUM_TONE_DESCRIPTORS = 512;
-    static const int NUM_SEGMENTS = 13;
+    static constexpr unsigned int TONEGEN_INF = 0xFFFFFFFFu;
+    static constexpr unsigned int TONE_CODE_END = 999;
+    static constexpr int FREQ_CODE_END = 99999;
+    static constexpr int NUM_TONE_DESCRIPTORS = 512;
+    static constexpr int NUM_SEGMENTS = 13;
 
     enum tone_state {
         TONE_IDLE = 0,

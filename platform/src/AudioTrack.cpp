@@ -4,6 +4,7 @@
 #include <media/AudioTrack.h>
 
 #include <algorithm>
+#include <mutex>
 #include <string>
 #include <thread>
 
@@ -44,6 +45,9 @@ struct AudioTrack::Impl {
     status_t status = NO_INIT;  // result of set()
     bool configured = false;
     std::atomic<float> volume{1.0f};
+    // Held while start() stores the thread handle: the new thread's first callback
+    // may already drop the track, and its destructor reads the handle.
+    std::mutex threadLock;
     std::thread thread;
 };
 
@@ -70,13 +74,18 @@ AudioTrack::~AudioTrack() {
     }
     tc.stateCond.notify_all();
     if (core->route) core->route->stop();  // a paced write returns at once
-    if (mImpl->thread.joinable()) {
+    std::thread thread;
+    {
+        std::lock_guard<std::mutex> lk(mImpl->threadLock);
+        thread = std::move(mImpl->thread);
+    }
+    if (thread.joinable()) {
         // Dropped from inside its own callback: the thread ends by itself once the
         // callback returns, and keeps the core alive until then.
-        if (mImpl->thread.get_id() == std::this_thread::get_id()) {
-            mImpl->thread.detach();
+        if (thread.get_id() == std::this_thread::get_id()) {
+            thread.detach();
         } else {
-            mImpl->thread.join();
+            thread.join();
         }
     }
 }
@@ -167,6 +176,7 @@ status_t AudioTrack::start() {
     tc.stateCond.notify_all();
     // In manual mode the test pumps the callbacks; a later start in automatic mode
     // still gets its thread.
+    std::lock_guard<std::mutex> lk(d.threadLock);
     if (!d.thread.joinable() && !tc.manual.load(std::memory_order_relaxed)) {
         d.thread = std::thread(playbackLoop, d.core);
     }

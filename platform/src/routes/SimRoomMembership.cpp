@@ -9,6 +9,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -238,12 +239,18 @@ std::unique_ptr<RoomMembership> RoomMembership::join(const std::string& room, Ro
                         " devices)");
         }
         if (role == Role::Speaker) {
-            for (int i = 0; i < kSpeakerSlots && m->mSlot < 0; ++i) {
-                if (layout->slots[i].owner.load(std::memory_order_acquire) == 0) {
-                    layout->slots[i].owner.store(self, std::memory_order_release);
+            // The free slot written longest ago: a speaker that just left may still
+            // have sound queued, and a newcomer in its slot would wait behind it.
+            int64_t oldest = INT64_MAX;
+            for (int i = 0; i < kSpeakerSlots; ++i) {
+                const SpeakerSlot& slot = layout->slots[i];
+                const int64_t end = slot.end.load(std::memory_order_acquire);
+                if (slot.owner.load(std::memory_order_acquire) == 0 && end < oldest) {
+                    oldest = end;
                     m->mSlot = i;
                 }
             }
+            if (m->mSlot >= 0) layout->slots[m->mSlot].owner.store(self, std::memory_order_release);
             if (m->mSlot < 0) {
                 unlockFile(fd);
                 m.reset();  // leaves again
