@@ -97,11 +97,10 @@ private:
         std::vector<std::pair<std::string, std::string>> env;
         // Each device's microphone hears noise of its own.
         env.emplace_back("KORVO_SIM_SEED", who == kListener ? "11" : "22");
-        if (mOpt.snrGiven) {
-            char level[32];
-            snprintf(level, sizeof level, "%.2f", mNoiseDbfs);
-            env.emplace_back("KORVO_SIM_NOISE", level);
-        }
+        // The demo decides the noise: none unless --snr asks for it (an empty value is none).
+        char level[32] = "";
+        if (mOpt.snrGiven) snprintf(level, sizeof level, "%.2f", mNoiseDbfs);
+        env.emplace_back("KORVO_SIM_NOISE", level);
         std::string error;
         if (!mChild[who].start(selfExecutable(), args, env, &error)) {
             errf("cannot start the %s: %s", kWhoName[who], error.c_str());
@@ -228,13 +227,14 @@ private:
         } else {
             outf("0 of %d exchanges completed\n", mOpt.rounds);
         }
-        bool devicesOk = status[kListener] == 0 && status[kSpeaker] == 0;
-        if (!started || mAborted || interrupted() || !devicesOk || completed != mOpt.rounds) {
-            if (!interrupted() && !devicesOk && started)
-                errf("a device failed (listener exit %d, speaker exit %d)", status[kListener], status[kSpeaker]);
-            return 1;
+        std::string failed;
+        for (int w = 0; w < 2; ++w) {
+            if (status[w] <= 0) continue;  // 0: finished well; -1: never started
+            failed += std::string(failed.empty() ? "" : ", ") + kWhoName[w] + " exit " + std::to_string(status[w]);
         }
-        return 0;
+        if (!failed.empty() && !interrupted()) errf("a device failed (%s)", failed.c_str());
+        bool allRan = status[kListener] == 0 && status[kSpeaker] == 0;
+        return started && allRan && !mAborted && !interrupted() && completed == mOpt.rounds ? 0 : 1;
     }
 
     const CommonOptions& mCommon;
