@@ -18,6 +18,7 @@
 #include "host/ChildProcess.h"
 #include "host/Clock.h"
 #include "host/CodePlan.h"
+#include "host/Environment.h"
 #include "host/Interrupt.h"
 #include "host/Options.h"
 #include "host/Output.h"
@@ -63,6 +64,7 @@ public:
     DemoRun(const CommonOptions& common, const DemoOptions& o) : mCommon(common), mOpt(o) {}
 
     int run() {
+        applyLogSettings(mCommon.verbose);  // the demo itself only visits the room at the end
         mRoom = uniqueRoomName();
         mStart = monotonicMs();
         std::string noise = "no noise";
@@ -269,7 +271,9 @@ Command addDemoCommand(CLI::App& app, CommonOptions& common) {
                options->snr = v;
                options->snrGiven = true;
            },
-           "add white noise to both microphones, this many dB below the tone (default: no noise)")
+           "add white noise to both microphones, this many dB below the tone, and raise the detection level "
+           "above it (default: no noise); below about 15 dB code 0 is lost first, its band catching only a "
+           "leak of its tone")
         ->check(CLI::Range(-20.0, 120.0));
     sub->add_option("--tone-ms", options->toneMs, "duration of each tone in milliseconds")
         ->check(CLI::Range(50, 5000))

@@ -21,7 +21,9 @@ bool applyRoute(const char* variable, const std::string& option, std::string* er
     return true;
 }
 
-void applyLog(int verbose) {
+}  // namespace
+
+void applyLogSettings(int verbose) {
     if (verbose > 0) {
         setenv("KORVO_LOG", "stderr", 1);
         setenv("KORVO_LOG_LEVEL", verbose > 1 ? "V" : "D", 1);
@@ -35,12 +37,10 @@ void applyLog(int verbose) {
     korvo::platform::reloadLogConfig();
 }
 
-}  // namespace
-
 bool applyEnvironment(const CommonOptions& common, std::string* error) {
     if (!applyRoute("KORVO_MIC", common.mic, error)) return false;
     if (!applyRoute("KORVO_SPEAKER", common.speaker, error)) return false;
-    applyLog(common.verbose);
+    applyLogSettings(common.verbose);
     return true;
 }
 

@@ -1,6 +1,4 @@
 // soundmeter monitor: a live view of the read-out in the terminal.
-#include <unistd.h>
-
 #include <string>
 
 #include <CLI/CLI.hpp>
@@ -74,7 +72,7 @@ int runMonitor(const CommonOptions& common, const MonitorOptions& o) {
     if (int status = session.open(settings)) return status;
     SoundMeter_vir& meter = session.meter();
     // Redraw in place on a terminal; elsewhere (a pipe, a file) frames follow each other.
-    bool ansi = isatty(STDOUT_FILENO) != 0;
+    bool ansi = hostOutputIsTerminal();
     if (ansi) outf("\x1b[?25l");  // no blinking cursor over the bars
 
     CodeTracker tracker;

@@ -39,6 +39,8 @@ void outf(const char* fmt, ...) {
     fflush(hostOut());
 }
 
+bool hostOutputIsTerminal() { return isatty(fileno(hostOut())) != 0; }
+
 void errf(const char* fmt, ...) {
     char line[1024];
     va_list ap;

@@ -19,6 +19,9 @@ namespace host {
 void initHostOutput();
 // printf to the host's own standard output, flushed at once.
 void outf(const char* fmt, ...) __attribute__((format(printf, 1, 2)));
+// Whether the host's own standard output is a terminal (descriptor 1 may be a pipe
+// to the plug-in's line handler meanwhile).
+bool hostOutputIsTerminal();
 // One line on stderr, "soundmeter: " in front and a line end added.
 void errf(const char* fmt, ...) __attribute__((format(printf, 1, 2)));
 

@@ -106,6 +106,13 @@ TEST(HostCli, MissingPlugInFailsWithOneLine) {
         EXPECT_EQ(countLines(r.err), 1u) << r.err;
         EXPECT_NE(r.err.find("cannot load the plug-in /nonexistent/libkorvo_soundmeter.so"), std::string::npos);
     }
+    // The demo's device fails the same way; the demo says so and fails too.
+    ProcessResult demo = run({"demo", "--plugin=/nonexistent/libkorvo_soundmeter.so"});
+    EXPECT_EQ(demo.status, 1);
+    EXPECT_NE(demo.err.find("soundmeter: cannot load the plug-in /nonexistent/libkorvo_soundmeter.so"),
+              std::string::npos);
+    EXPECT_NE(demo.err.find("soundmeter: a device failed (listener exit 1)\n"), std::string::npos) << demo.err;
+    EXPECT_NE(demo.out.find("0 of 3 exchanges completed\n"), std::string::npos) << demo.out;
 }
 
 TEST(HostCli, PlatformLogAndPlugInOutputOnlyWithVerbose) {

@@ -77,6 +77,12 @@ TEST_F(RoutesTest, RouteTexts) {
         EXPECT_NE(error.find(std::string("'") + bad + "'"), std::string::npos) << error;
     }
     EXPECT_FALSE(validateRoute("foo", nullptr));
+    // A room name that the room would refuse is refused up front.
+    for (const char* bad : {"sim:a/b", "sim:has space"}) {
+        error.clear();
+        EXPECT_FALSE(validateRoute(bad, &error)) << bad;
+        EXPECT_FALSE(error.empty()) << bad;
+    }
 
     error.clear();
     EXPECT_EQ(makeCaptureRoute("bogus:x", &error), nullptr);

@@ -4,6 +4,7 @@
 #include <cstdlib>
 
 #include "routes/RouteFactories.h"
+#include "routes/SimRoomConfig.h"
 
 namespace korvo {
 namespace platform {
@@ -93,7 +94,10 @@ std::unique_ptr<OutputRoute> makeOutputRoute(const std::string& route, std::stri
 
 bool validateRoute(const std::string& route, std::string* error) {
     RouteText t;
-    return parse(route, &t, error);
+    if (!parse(route, &t, error)) return false;
+    // A room name is checked here too, so that a host refuses it before anything opens.
+    if (t.kind == RouteKind::Sim) return sim::validateRoomName(t.arg, error);
+    return true;
 }
 
 std::string micRoute() { return envRoute("KORVO_MIC"); }
