@@ -87,6 +87,6 @@ TEST_F(FrameExchangeTest, ReadDoneLevels) {
     EXPECT_FALSE(std::isfinite(readDone(square.data(), 0)));
 }
 
-TEST(FrameExchangeLayout, RecordIsPackedAsSpecifiedForTheHost) {
+TEST(FrameExchangeLayout, RecordIsPackedWithoutGaps) {
     EXPECT_EQ(sizeof(Mmic_data_t), 4u + 4u + 5120u + 4u + 4u);
 }
