@@ -66,6 +66,11 @@ public:
     int run() {
         applyLogSettings(mCommon.verbose);  // the demo itself only visits the room at the end
         mRoom = uniqueRoomName();
+        // --mic / --speaker put both devices on the given routes (a named room that a monitor
+        // can join, for instance); a route not given is the fresh room's.
+        mMic = mCommon.mic.empty() ? "sim:" + mRoom : mCommon.mic;
+        mSpeaker = mCommon.speaker.empty() ? "sim:" + mRoom : mCommon.speaker;
+        const bool freshRoom = mCommon.mic.empty() || mCommon.speaker.empty();
         mStart = monotonicMs();
         std::string noise = "no noise";
         if (mOpt.snrGiven) {
@@ -75,14 +80,15 @@ public:
                      detectionLevelFor(mNoiseDbfs));
             noise = text;
         }
-        outf("demo in room %s: %d round%s, acknowledgement %s, tones of %d ms, %s\n", mRoom.c_str(), mOpt.rounds,
+        const std::string where = freshRoom ? "in room " + mRoom : "on mic " + mMic + ", speaker " + mSpeaker;
+        outf("demo %s: %d round%s, acknowledgement %s, tones of %d ms, %s\n", where.c_str(), mOpt.rounds,
              mOpt.rounds == 1 ? "" : "s", mOpt.noAck ? "off" : "on", mOpt.toneMs, noise.c_str());
 
         bool started = startDevice(kListener);
         if (started) pump();
         int status[2] = {-1, -1};
         finish(status);
-        removeRoom();
+        if (freshRoom) removeRoom();
         return summarize(started, status);
     }
 
@@ -91,7 +97,7 @@ private:
         std::vector<std::string> args = {"soundmeter", "handshake", "--role", kWhoName[who],
                                          "--rounds", std::to_string(mOpt.rounds), "--tone-ms",
                                          std::to_string(mOpt.toneMs), "--timeout-ms", std::to_string(mOpt.timeoutMs),
-                                         "--mic", "sim:" + mRoom, "--speaker", "sim:" + mRoom};
+                                         "--mic", mMic, "--speaker", mSpeaker};
         if (mOpt.noAck) args.push_back("--no-ack");
         if (mOpt.snrGiven) args.push_back("--level=" + std::to_string(detectionLevelFor(mNoiseDbfs)));
         for (int i = 0; i < mCommon.verbose; ++i) args.push_back("-v");
@@ -242,6 +248,8 @@ private:
     const CommonOptions& mCommon;
     const DemoOptions& mOpt;
     std::string mRoom;
+    std::string mMic;
+    std::string mSpeaker;
     int64_t mStart = 0;
     double mNoiseDbfs = 0.0;
     ChildProcess mChild[2];
@@ -281,6 +289,8 @@ Command addDemoCommand(CLI::App& app, CommonOptions& common) {
     sub->add_option("--timeout-ms", options->timeoutMs, "how long a device waits for each code")
         ->check(CLI::Range(500, 600000))
         ->capture_default_str();
+    // Both devices use these routes instead of the fresh room (e.g. sim:lab, which a monitor can join).
+    addRouteOptions(sub, common, "the fresh room", "the fresh room");
     return {sub, [&common, options] {
                 DemoRun demo(common, *options);
                 return demo.run();

@@ -21,12 +21,14 @@ CLI::Validator routeValidator() {
 
 }  // namespace
 
-void addRouteOptions(CLI::App* sub, CommonOptions& common) {
+void addRouteOptions(CLI::App* sub, CommonOptions& common, const char* micDefault, const char* speakerDefault) {
     sub->add_option("--mic", common.mic,
-                    "microphone ROUTE: null, wav:PATH, sim:ROOM or card[:DEVICE] (default: KORVO_MIC, else null)")
+                    std::string("microphone ROUTE: null, wav:PATH, sim:ROOM or card[:DEVICE] (default: ") +
+                        micDefault + ")")
         ->check(routeValidator());
     sub->add_option("--speaker", common.speaker,
-                    "speaker ROUTE: null, wav:PATH, sim:ROOM or card[:DEVICE] (default: KORVO_SPEAKER, else null)")
+                    std::string("speaker ROUTE: null, wav:PATH, sim:ROOM or card[:DEVICE] (default: ") +
+                        speakerDefault + ")")
         ->check(routeValidator());
 }
 

@@ -25,8 +25,9 @@ struct Command {
     Action action;
 };
 
-// Adds --mic and --speaker, checked as ROUTE texts.
-void addRouteOptions(CLI::App* sub, CommonOptions& common);
+// Adds --mic and --speaker, checked as ROUTE texts; the defaults are named in their help.
+void addRouteOptions(CLI::App* sub, CommonOptions& common, const char* micDefault = "KORVO_MIC, else null",
+                     const char* speakerDefault = "KORVO_SPEAKER, else null");
 
 Command addDemoCommand(CLI::App& app, CommonOptions& common);
 Command addListenCommand(CLI::App& app, CommonOptions& common);

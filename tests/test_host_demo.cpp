@@ -139,6 +139,16 @@ TEST(HostDemo, ExchangesWithoutAcknowledgement) {
     expectCleanedUp(r.out);
 }
 
+TEST(HostDemo, RunsOnTheRoutesItIsGivenAndLeavesThatRoomAlone) {
+    const std::string room = uniqueRoom("demo-routes");
+    ProcessResult r = runHost(kHost, with({"demo", "--rounds", "1"}, routes(room)), kRunMs);
+    ASSERT_EQ(r.status, 0) << r.out << r.err;
+    EXPECT_NE(r.out.find("demo on mic sim:" + room + ", speaker sim:" + room), std::string::npos) << r.out;
+    EXPECT_NE(r.out.find("1 of 1 exchanges completed"), std::string::npos) << r.out;
+    EXPECT_EQ(r.out.find("removed"), std::string::npos) << r.out;
+    EXPECT_FALSE(roomExists(room));  // its last member left
+}
+
 TEST(HostDemo, ExchangesInNoiseAndFailsWhenNoiseDrownsTheCodes) {
     // 25 dB below the tone: the detection level rises above the noise, the tones stay above it.
     ProcessResult r = runHost(kHost, {"demo", "--snr", "25", "--rounds", "5"}, kRunMs);
