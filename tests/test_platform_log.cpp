@@ -1,41 +1,32 @@
 // The platform log: line format, priorities, destinations, capture and whole lines under
 // concurrent writers.
-#include <gtest/gtest.h>
-
 #include <fcntl.h>
-#include <spawn.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <cstdlib>
-#include <fstream>
 #include <set>
 #include <sstream>
-#include <string>
-#include <thread>
-#include <vector>
 
 #include <korvo/platform/Log.h>
-#include <korvo/platform/TestControl.h>
 #include <log/log.h>
 
-extern char** environ;
+#include "support/PlatformTestSupport.h"
+
+using namespace korvo::platformtest;
+using korvo::platform::reloadLogConfig;
 
 namespace {
 
-namespace test = korvo::platform::test;
-
-std::string readFile(const std::string& path) {
-    std::ifstream in(path, std::ios::binary);
-    std::stringstream ss;
-    ss << in.rdbuf();
-    return ss.str();
-}
-
-std::string tempPath(const char* name) {
-    return "/tmp/korvo-log-" + std::to_string(getpid()) + "-" + name;
-}
+// Child half of ReadsTheEnvironmentAtTheFirstCall: started with KORVO_LOG_CHILD set, the
+// program logs with the environment it was started with, before any test runs, and exits.
+[[maybe_unused]] const bool sLogChild = [] {
+    if (!std::getenv("KORVO_LOG_CHILD")) return false;
+    __android_log_print(ANDROID_LOG_VERBOSE, "C", "v");
+    __android_log_print(ANDROID_LOG_INFO, "C", "first %d", 1);
+    setenv("KORVO_LOG", "off", 1);  // read once: later changes need reloadLogConfig
+    __android_log_print(ANDROID_LOG_INFO, "C", "second");
+    _exit(0);
+}();
 
 // Sends this process's stderr to a file while alive.
 class StderrToFile {
@@ -47,53 +38,39 @@ public:
         dup2(fd, STDERR_FILENO);
         close(fd);
     }
-    ~StderrToFile() { restore(); }
+    ~StderrToFile() { finish(); }
     std::string finish() {
-        restore();
+        if (mSaved >= 0) {
+            fflush(stderr);
+            dup2(mSaved, STDERR_FILENO);
+            close(mSaved);
+            mSaved = -1;
+        }
         return readFile(mPath);
     }
 
 private:
-    void restore() {
-        if (mSaved < 0) return;
-        fflush(stderr);
-        dup2(mSaved, STDERR_FILENO);
-        close(mSaved);
-        mSaved = -1;
-    }
     std::string mPath;
     int mSaved = -1;
 };
 
-void setEnv(const char* name, const char* value) {
-    if (value) {
-        setenv(name, value, 1);
-    } else {
-        unsetenv(name);
-    }
-}
-
-class LogTest : public ::testing::Test {
+class LogTest : public PlatformFixture {
 protected:
-    void SetUp() override { test::resetAll(); }
     void TearDown() override {
-        unsetenv("KORVO_LOG");
-        unsetenv("KORVO_LOG_LEVEL");
-        korvo::platform::reloadLogConfig();
-        for (const auto& p : mFiles) unlink(p.c_str());
+        PlatformFixture::TearDown();
+        mEnv.restore();
+        reloadLogConfig();
     }
-    std::string file(const char* name) {
-        mFiles.push_back(tempPath(name));
-        unlink(mFiles.back().c_str());
-        return mFiles.back();
+    // Sets both variables (nullptr: unset) and reloads the configuration.
+    void configure(const char* log, const char* level) {
+        mEnv.set("KORVO_LOG", log);
+        mEnv.set("KORVO_LOG_LEVEL", level);
+        reloadLogConfig();
     }
-    std::vector<std::string> mFiles;
 };
 
-}  // namespace
-
 TEST_F(LogTest, LineFormatAndPriorityLetters) {
-    const std::string path = file("format.log");
+    const std::string path = mFiles.path("format.log");
     korvo::platform::setLogTarget(path, 'V');
     __android_log_print(ANDROID_LOG_DEBUG, "TQX", "[%s] AudioRecord preparation %d\n", "SoundMeter", 200);
     __android_log_print(ANDROID_LOG_VERBOSE, "TQX", "v");
@@ -103,6 +80,10 @@ TEST_F(LogTest, LineFormatAndPriorityLetters) {
     __android_log_print(ANDROID_LOG_FATAL, "KeyedVector", "%s", "");
     __android_log_print(ANDROID_LOG_DEFAULT, "T", "below verbose");
     __android_log_print(ANDROID_LOG_DEBUG, "TQX", "[%s] Audio read failed rror = %d", "SoundMeter", -16);
+    // Long lines stay whole, and so does one that just fills the line buffer.
+    const std::string tag(1500, 't'), msg(5000, 'm');
+    __android_log_print(ANDROID_LOG_DEBUG, tag.c_str(), "%s|%d\n", msg.c_str(), 42);
+    __android_log_print(ANDROID_LOG_DEBUG, "T", "%s", std::string(1014, 'x').c_str());
     EXPECT_EQ(readFile(path),
               "D/TQX: [SoundMeter] AudioRecord preparation 200\n"
               "V/TQX: v\n"
@@ -111,26 +92,13 @@ TEST_F(LogTest, LineFormatAndPriorityLetters) {
               "E/TQX: [WAVEFORM_CANVAS] detection Level is -5\n"
               "F/KeyedVector: \n"
               "V/T: below verbose\n"
-              "D/TQX: [SoundMeter] Audio read failed rror = -16\n");
-}
-
-TEST_F(LogTest, LongLinesStayWhole) {
-    const std::string path = file("long.log");
-    korvo::platform::setLogTarget(path, 'D');
-    const std::string tag(1500, 't');
-    const std::string msg(5000, 'm');
-    __android_log_print(ANDROID_LOG_DEBUG, tag.c_str(), "%s|%d\n", msg.c_str(), 42);
-    __android_log_print(ANDROID_LOG_DEBUG, "T", "%s", std::string(1014, 'x').c_str());  // fills the line buffer
-    EXPECT_EQ(readFile(path), "D/" + tag + ": " + msg + "|42\n" + "D/T: " + std::string(1014, 'x') + "\n");
+              "D/TQX: [SoundMeter] Audio read failed rror = -16\n"
+              "D/" + tag + ": " + msg + "|42\n" + "D/T: " + std::string(1014, 'x') + "\n");
 }
 
 TEST_F(LogTest, LevelsFilesAndOffFromTheEnvironment) {
-    const std::string path = file("env.log");
-    struct Case {
-        const char* level;
-        const char* expected;
-    };
-    const Case cases[] = {
+    const std::string path = mFiles.path("env.log");
+    const std::pair<const char*, const char*> cases[] = {
         {nullptr, "D/T: d\nI/T: i\nW/T: w\nE/T: e\nF/T: f\n"},  // KORVO_LOG alone: from D on
         {"V", "V/T: v\nD/T: d\nI/T: i\nW/T: w\nE/T: e\nF/T: f\n"},
         {"D", "D/T: d\nI/T: i\nW/T: w\nE/T: e\nF/T: f\n"},
@@ -138,37 +106,29 @@ TEST_F(LogTest, LevelsFilesAndOffFromTheEnvironment) {
         {"W", "W/T: w\nE/T: e\nF/T: f\n"},
         {"E", "E/T: e\nF/T: f\n"},
     };
-    for (const Case& c : cases) {
+    for (const auto& [level, expected] : cases) {
         unlink(path.c_str());
-        setEnv("KORVO_LOG", path.c_str());
-        setEnv("KORVO_LOG_LEVEL", c.level);
-        korvo::platform::reloadLogConfig();
+        configure(path.c_str(), level);
         for (int p = ANDROID_LOG_VERBOSE; p <= ANDROID_LOG_FATAL; ++p) {
             const char letter[] = {"vdiwef"[p - ANDROID_LOG_VERBOSE], '\0'};
             __android_log_print(p, "T", "%s", letter);
         }
-        EXPECT_EQ(readFile(path), c.expected) << "level " << (c.level ? c.level : "(unset)");
+        EXPECT_EQ(readFile(path), expected) << "level " << (level ? level : "(unset)");
     }
-
     // The file is appended to, never truncated.
-    korvo::platform::reloadLogConfig();
+    reloadLogConfig();
     __android_log_print(ANDROID_LOG_ERROR, "T", "again");
     EXPECT_EQ(readFile(path), "E/T: e\nF/T: f\nE/T: again\n");
-
     // off writes nothing, whatever the level.
     unlink(path.c_str());
-    setEnv("KORVO_LOG", "off");
-    setEnv("KORVO_LOG_LEVEL", "V");
-    korvo::platform::reloadLogConfig();
+    configure("off", "V");
     __android_log_print(ANDROID_LOG_FATAL, "T", "nothing");
     EXPECT_NE(access(path.c_str(), F_OK), 0);
 }
 
 TEST_F(LogTest, StderrTargets) {
     struct Case {
-        const char* log;
-        const char* level;
-        const char* expected;
+        const char *log, *level, *expected;
     };
     const Case cases[] = {
         {nullptr, nullptr, ""},  // the default: silent
@@ -179,10 +139,8 @@ TEST_F(LogTest, StderrTargets) {
         {"off", "V", ""},
     };
     for (const Case& c : cases) {
-        setEnv("KORVO_LOG", c.log);
-        setEnv("KORVO_LOG_LEVEL", c.level);
-        korvo::platform::reloadLogConfig();
-        StderrToFile capture(file("stderr.txt"));
+        configure(c.log, c.level);
+        StderrToFile capture(mFiles.path("stderr.txt"));
         __android_log_print(ANDROID_LOG_VERBOSE, "S", "v");
         __android_log_print(ANDROID_LOG_DEBUG, "S", "d\n");
         __android_log_print(ANDROID_LOG_ERROR, "S", "e");
@@ -191,10 +149,8 @@ TEST_F(LogTest, StderrTargets) {
     }
 
     // A log file that cannot be opened is reported once on stderr; the log stays off.
-    setEnv("KORVO_LOG", "/nonexistent-korvo-dir/x.log");
-    setEnv("KORVO_LOG_LEVEL", nullptr);
-    StderrToFile capture(file("stderr-bad.txt"));
-    korvo::platform::reloadLogConfig();
+    StderrToFile capture(mFiles.path("stderr-bad.txt"));
+    configure("/nonexistent-korvo-dir/x.log", nullptr);
     __android_log_print(ANDROID_LOG_ERROR, "S", "lost");
     const std::string err = capture.finish();
     EXPECT_EQ(err.find("lost"), std::string::npos);
@@ -231,35 +187,29 @@ TEST_F(LogTest, CaptureKeepsEveryLine) {
 }
 
 TEST_F(LogTest, ConcurrentWritersNeverInterleave) {
-    const std::string path = file("threads.log");
+    const std::string path = mFiles.path("threads.log");
     korvo::platform::setLogTarget(path, 'D');
     test::captureLog(true);
-    constexpr int kThreads = 6;
-    constexpr int kLines = 400;
+    constexpr int kThreads = 6, kLines = 400;
+    // Some lines are longer than the stack buffer, to take the other path too.
+    auto pad = [](int t) { return std::string(t % 2 ? 1500 : 20, static_cast<char>('a' + t)); };
     std::vector<std::thread> threads;
-    for (int t = 0; t < kThreads; ++t) {
-        threads.emplace_back([t] {
-            // Some lines are longer than the stack buffer, to take the other path too.
-            const std::string pad(t % 2 ? 1500 : 20, static_cast<char>('a' + t));
-            for (int i = 0; i < kLines; ++i) {
-                __android_log_print(ANDROID_LOG_DEBUG, "W", "thread %d line %d %s\n", t, i, pad.c_str());
-            }
-        });
-    }
-    for (auto& th : threads) th.join();
     std::set<std::string> expected;
     for (int t = 0; t < kThreads; ++t) {
-        const std::string pad(t % 2 ? 1500 : 20, static_cast<char>('a' + t));
+        threads.emplace_back([t, p = pad(t)] {
+            for (int i = 0; i < kLines; ++i) {
+                __android_log_print(ANDROID_LOG_DEBUG, "W", "thread %d line %d %s\n", t, i, p.c_str());
+            }
+        });
         for (int i = 0; i < kLines; ++i) {
-            expected.insert("D/W: thread " + std::to_string(t) + " line " + std::to_string(i) + " " + pad);
+            expected.insert("D/W: thread " + std::to_string(t) + " line " + std::to_string(i) + " " + pad(t));
         }
     }
+    for (auto& th : threads) th.join();
     std::istringstream in(readFile(path));
-    std::string line;
     std::set<std::string> seen;
     int count = 0;
-    while (std::getline(in, line)) {
-        ++count;
+    for (std::string line; std::getline(in, line); ++count) {
         EXPECT_EQ(expected.count(line), 1u) << line.substr(0, 80);
         seen.insert(line);
     }
@@ -268,41 +218,12 @@ TEST_F(LogTest, ConcurrentWritersNeverInterleave) {
     EXPECT_EQ(test::logLines().size(), static_cast<size_t>(kThreads * kLines));
 }
 
-// Child half of the next test: started with KORVO_LOG_CHILD set, the program logs with the
-// environment it was started with, before any test runs, and exits.
-namespace {
-[[maybe_unused]] const bool sLogChild = [] {
-    if (!std::getenv("KORVO_LOG_CHILD")) return false;
-    __android_log_print(ANDROID_LOG_VERBOSE, "C", "v");
-    __android_log_print(ANDROID_LOG_INFO, "C", "first %d", 1);
-    setenv("KORVO_LOG", "off", 1);  // read once: later changes need reloadLogConfig
-    __android_log_print(ANDROID_LOG_INFO, "C", "second");
-    _exit(0);
-}();
-}  // namespace
-
 TEST_F(LogTest, ReadsTheEnvironmentAtTheFirstCall) {
-    const std::string path = file("child.log");
-    const std::string logEnv = "KORVO_LOG=" + path;
-    std::vector<std::string> env = {logEnv, "KORVO_LOG_LEVEL=I", "KORVO_LOG_CHILD=1"};
-    for (char** e = environ; *e; ++e) {
-        const std::string s(*e);
-        if (s.rfind("KORVO_LOG", 0) != 0 && s.rfind("GTEST_", 0) != 0) env.push_back(s);
-    }
-    std::vector<char*> envp;
-    for (auto& s : env) envp.push_back(&s[0]);
-    envp.push_back(nullptr);
-    std::string self = "/proc/self/exe";
-    char* argv[] = {&self[0], nullptr};
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
-    pid_t pid = 0;
-    ASSERT_EQ(posix_spawn(&pid, self.c_str(), &actions, nullptr, argv, envp.data()), 0);
-    posix_spawn_file_actions_destroy(&actions);
-    int status = 0;
-    ASSERT_EQ(waitpid(pid, &status, 0), pid);
-    ASSERT_TRUE(WIFEXITED(status));
-    EXPECT_EQ(WEXITSTATUS(status), 0);
+    const std::string path = mFiles.path("child.log");
+    Child child({{"KORVO_LOG", path}, {"KORVO_LOG_LEVEL", "I"}, {"KORVO_LOG_CHILD", "1"}});
+    ASSERT_TRUE(child.started());
+    EXPECT_EQ(child.waitExit(), 0);
     EXPECT_EQ(readFile(path), "I/C: first 1\nI/C: second\n");
 }
+
+}  // namespace

@@ -1,44 +1,22 @@
 // The capture stream: configuration, the scripted microphone, stop against a blocked read,
 // the null route's real-time pace and a WAV file heard through the stream.
-#include <gtest/gtest.h>
-
-#include <sndfile.h>
-#include <unistd.h>
-
-#include <atomic>
-#include <chrono>
-#include <cstdlib>
 #include <future>
-#include <string>
-#include <thread>
-#include <vector>
 
-#include <korvo/platform/TestControl.h>
 #include <log/log.h>
 #include <media/AudioRecord.h>
 #include <utils/Timers.h>
 
+#include "support/PlatformTestSupport.h"
+
 using namespace android;
+using namespace korvo::platformtest;
 
 namespace {
 
-namespace test = korvo::platform::test;
-
-template <typename Pred>
-bool waitUntil(Pred pred, int timeoutMs = 5000) {
-    const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
-    while (!pred()) {
-        if (std::chrono::steady_clock::now() > end) return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(1));
-    }
-    return true;
-}
-
 sp<AudioRecord> makeRecord(size_t frameCount = 0) {
     sp<AudioRecord> r = new AudioRecord(String16());
-    r->set(AUDIO_SOURCE_MIC, 44100, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_MONO, frameCount, nullptr,
-           nullptr, 0, false, AUDIO_SESSION_ALLOCATE, AudioRecord::TRANSFER_SYNC, AUDIO_INPUT_FLAG_NONE, -1, -1,
-           nullptr);
+    r->set(AUDIO_SOURCE_MIC, 44100, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_MONO, frameCount, nullptr, nullptr, 0,
+           false, AUDIO_SESSION_ALLOCATE, AudioRecord::TRANSFER_SYNC, AUDIO_INPUT_FLAG_NONE, -1, -1, nullptr);
     return r;
 }
 
@@ -48,27 +26,16 @@ std::vector<int16_t> ramp(size_t n, int start) {
     return v;
 }
 
-class RecordTest : public ::testing::Test {
-protected:
-    void SetUp() override {
-        test::resetAll();
-        unsetenv("KORVO_MIC");
-    }
-    void TearDown() override {
-        test::resetAll();
-        unsetenv("KORVO_MIC");
-        for (const auto& p : mFiles) unlink(p.c_str());
-    }
-    std::string file(const char* name) {
-        mFiles.push_back("/tmp/korvo-record-" + std::to_string(getpid()) + "-" + name);
-        return mFiles.back();
-    }
-    std::vector<std::string> mFiles;
-};
+// A blocking read of 1024 bytes on another thread, once it waits in the script.
+std::future<ssize_t> blockedRead(const sp<AudioRecord>& r, std::vector<int16_t>& buf) {
+    auto f = std::async(std::launch::async, [r, &buf] { return r->read(buf.data(), 1024, true); });
+    EXPECT_TRUE(waitUntil([] { return test::micReadersWaiting() == 1; }));
+    return f;
+}
 
-}  // namespace
+using RecordTest = PlatformFixture;
 
-TEST_F(RecordTest, MinFrameCountAndConfiguration) {
+TEST_F(RecordTest, ConfigurationAndBadRoutes) {
     size_t frames = 0;
     EXPECT_EQ(AudioRecord::getMinFrameCount(&frames, 44100, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_MONO), OK);
     EXPECT_EQ(frames, 1024u);
@@ -95,8 +62,7 @@ TEST_F(RecordTest, MinFrameCountAndConfiguration) {
     EXPECT_EQ(r->getSampleRate(), 44100u);
     EXPECT_TRUE(r->stopped());
     EXPECT_EQ(r->set(AUDIO_SOURCE_MIC, 44100, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_MONO), INVALID_OPERATION);
-    sp<AudioRecord> big = makeRecord(2048);
-    EXPECT_EQ(big->frameCount(), 2048u);
+    EXPECT_EQ(makeRecord(2048)->frameCount(), 2048u);
 
     // Only 16-bit mono is delivered.
     sp<AudioRecord> stereo = new AudioRecord(String16());
@@ -106,43 +72,41 @@ TEST_F(RecordTest, MinFrameCountAndConfiguration) {
 
     // The minimum is looked up when the frame count is 0 and may fail.
     test::failMinFrameCount(-EIO);
-    sp<AudioRecord> failing = makeRecord(0);
-    EXPECT_EQ(failing->initCheck(), -EIO);
-}
+    EXPECT_EQ(makeRecord(0)->initCheck(), -EIO);
+    test::resetAll();
 
-TEST_F(RecordTest, BadRouteTextMakesTheStreamUnusable) {
+    // A bad route text makes the stream unusable.
     setenv("KORVO_MIC", "foo", 1);
     test::captureLog(true);
-    sp<AudioRecord> r = new AudioRecord(String16());
-    EXPECT_EQ(r->set(AUDIO_SOURCE_MIC, 44100, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_MONO, 1024), NO_INIT);
-    EXPECT_EQ(r->initCheck(), NO_INIT);
+    sp<AudioRecord> bad = new AudioRecord(String16());
+    EXPECT_EQ(bad->set(AUDIO_SOURCE_MIC, 44100, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_MONO, 1024), NO_INIT);
+    EXPECT_EQ(bad->initCheck(), NO_INIT);
     const auto lines = test::logLines();
     ASSERT_EQ(lines.size(), 1u);
     EXPECT_EQ(lines[0].prio, ANDROID_LOG_ERROR);
     EXPECT_EQ(lines[0].tag, "AudioRecord");
     EXPECT_NE(lines[0].msg.find("unknown audio route 'foo' (expected null, wav:PATH, sim:ROOM or card[:DEVICE])"),
               std::string::npos);
-    EXPECT_EQ(r->start(), NO_INIT);
-    int16_t buf[16];
+    EXPECT_EQ(bad->start(), NO_INIT);
     test::scriptMic(true);  // even a script does not revive it
-    EXPECT_EQ(r->read(buf, sizeof(buf), true), NO_INIT);
+    EXPECT_EQ(bad->read(buf, sizeof(buf), true), NO_INIT);
 
     setenv("KORVO_MIC", "wav:/nonexistent-korvo-dir/none.wav", 1);
     test::clearLog();
-    sp<AudioRecord> missing = makeRecord();
-    EXPECT_EQ(missing->initCheck(), NO_INIT);
+    EXPECT_EQ(makeRecord()->initCheck(), NO_INIT);
     ASSERT_EQ(test::logLines().size(), 1u);
     EXPECT_NE(test::logLines()[0].msg.find("cannot read WAV file"), std::string::npos);
 }
 
-TEST_F(RecordTest, ReadsOutsideAStartedStream) {
+TEST_F(RecordTest, ScriptedMicrophone) {
     test::scriptMic(true);
-    int16_t in[4] = {1, 2, 3, 4};
-    test::pushMicSamples(in, 4);
+    int16_t four[4] = {1, 2, 3, 4};
+    test::pushMicSamples(four, 4);
     sp<AudioRecord> r = makeRecord();
-    int16_t buf[4] = {};
-    EXPECT_EQ(r->read(buf, sizeof(buf), true), 0);  // never started
-    EXPECT_EQ(r->read(buf, sizeof(buf), false), INVALID_OPERATION);
+    EXPECT_EQ(test::lastMicReadRequest(), 0u);
+    // Reads outside a started stream.
+    EXPECT_EQ(r->read(four, sizeof(four), true), 0);  // never started
+    EXPECT_EQ(r->read(four, sizeof(four), false), INVALID_OPERATION);
     EXPECT_EQ(r->read(nullptr, 8, true), BAD_VALUE);
     ASSERT_EQ(r->start(), OK);
     EXPECT_FALSE(r->stopped());
@@ -150,23 +114,17 @@ TEST_F(RecordTest, ReadsOutsideAStartedStream) {
     EXPECT_EQ(r->read(bytes + 1, 8, true), BAD_VALUE);  // not on a sample boundary
     r->stop();
     EXPECT_TRUE(r->stopped());
-    EXPECT_EQ(r->read(buf, sizeof(buf), true), 0);  // stopped
+    EXPECT_EQ(r->read(four, sizeof(four), true), 0);  // stopped
     EXPECT_EQ(test::micSamplesQueued(), 4u);
     ASSERT_EQ(r->start(), OK);  // a second start resumes
-    EXPECT_EQ(r->read(buf, sizeof(buf), true), 8);
+    std::vector<int16_t> buf(512, 0);
+    EXPECT_EQ(r->read(buf.data(), 8, true), 8);
     EXPECT_EQ(buf[3], 4);
-}
-
-TEST_F(RecordTest, ScriptedMicrophone) {
-    test::scriptMic(true);
-    sp<AudioRecord> r = makeRecord();
-    ASSERT_EQ(r->start(), OK);
-    EXPECT_EQ(test::lastMicReadRequest(), 0u);
+    EXPECT_EQ(test::lastMicReadRequest(), 8u);
 
     // Whole frames.
     const auto frame = ramp(512, -1000);
     test::pushMicSamples(frame.data(), frame.size());
-    std::vector<int16_t> buf(512, 0);
     EXPECT_EQ(r->read(buf.data(), 1024, true), 1024);
     EXPECT_EQ(buf, frame);
     EXPECT_EQ(test::lastMicReadRequest(), 1024u);
@@ -193,12 +151,10 @@ TEST_F(RecordTest, ScriptedMicrophone) {
     EXPECT_EQ(test::micSamplesQueued(), 7u);
 
     // 0 and negative statuses come back as they are and consume nothing.
-    test::pushMicResult(0);
-    test::pushMicResult(-32);
-    test::pushMicResult(NO_INIT);
-    EXPECT_EQ(r->read(buf.data(), 1024, true), 0);
-    EXPECT_EQ(r->read(buf.data(), 1024, true), -32);
-    EXPECT_EQ(r->read(buf.data(), 1024, true), NO_INIT);
+    for (ssize_t status : {ssize_t(0), ssize_t(-32), ssize_t(NO_INIT)}) test::pushMicResult(status);
+    for (ssize_t status : {ssize_t(0), ssize_t(-32), ssize_t(NO_INIT)}) {
+        EXPECT_EQ(r->read(buf.data(), 1024, true), status);
+    }
     EXPECT_EQ(test::micSamplesQueued(), 7u);
 }
 
@@ -207,55 +163,62 @@ TEST_F(RecordTest, BlockedReadWaitsForSamplesAndStop) {
     sp<AudioRecord> r = makeRecord();
     ASSERT_EQ(r->start(), OK);
     const auto frame = ramp(512, 5);
+    std::vector<int16_t> buf(512, 0);
 
     // Blocked until the whole request is queued.
-    std::vector<int16_t> buf(512, 0);
-    auto reader = std::async(std::launch::async, [&] { return r->read(buf.data(), 1024, true); });
-    ASSERT_TRUE(waitUntil([] { return test::micReadersWaiting() == 1; }));
+    auto whole = blockedRead(r, buf);
     test::pushMicSamples(frame.data(), 100);
     test::pushMicSamples(frame.data() + 100, 412);
-    EXPECT_EQ(reader.get(), 1024);
+    EXPECT_EQ(whole.get(), 1024);
     EXPECT_EQ(buf, frame);
     EXPECT_EQ(test::micReadersWaiting(), 0);
 
     // A queued short count waits for its own size only.
     test::pushMicResult(200);
-    auto shortReader = std::async(std::launch::async, [&] { return r->read(buf.data(), 1024, true); });
-    ASSERT_TRUE(waitUntil([] { return test::micReadersWaiting() == 1; }));
+    auto shortRead = blockedRead(r, buf);
     test::pushMicSamples(frame.data(), 100);
-    EXPECT_EQ(shortReader.get(), 200);
+    EXPECT_EQ(shortRead.get(), 200);
 
-    // stop() from another thread ends a blocked read with nothing.
-    auto stopped = std::async(std::launch::async, [&] { return r->read(buf.data(), 1024, true); });
-    ASSERT_TRUE(waitUntil([] { return test::micReadersWaiting() == 1; }));
+    // stop() from another thread ends a blocked read with nothing...
+    auto stopped = blockedRead(r, buf);
     r->stop();
     EXPECT_EQ(stopped.get(), 0);
 
     // ... or with what had arrived.
     ASSERT_EQ(r->start(), OK);
     test::pushMicSamples(frame.data(), 30);
-    auto partial = std::async(std::launch::async, [&] { return r->read(buf.data(), 1024, true); });
-    ASSERT_TRUE(waitUntil([] { return test::micReadersWaiting() == 1; }));
+    auto partial = blockedRead(r, buf);
     r->stop();
     EXPECT_EQ(partial.get(), 60);
 
     // Switching the script off (resetAll in a test's SetUp) releases a reader too.
     ASSERT_EQ(r->start(), OK);
-    auto released = std::async(std::launch::async, [&] { return r->read(buf.data(), 1024, true); });
-    ASSERT_TRUE(waitUntil([] { return test::micReadersWaiting() == 1; }));
+    auto released = blockedRead(r, buf);
     test::resetAll();
     EXPECT_EQ(released.get(), 0);
 }
 
-TEST_F(RecordTest, StopRacesReadsOnTheNullRoute) {
+TEST_F(RecordTest, NullRouteDeliversSilenceAtRealTimePaceUntilStopped) {
     sp<AudioRecord> r = makeRecord();
+    std::vector<int16_t> buf(44100, 123);
+    const nsecs_t t0 = systemTime(SYSTEM_TIME_MONOTONIC);
+    ASSERT_EQ(r->start(), OK);
+    EXPECT_EQ(r->read(buf.data(), 8820, true), 8820);
+    EXPECT_GE(systemTime(SYSTEM_TIME_MONOTONIC) - t0, 100000000);  // 4410 samples are 100 ms: never sooner
+    for (size_t i = 0; i < 4410; ++i) ASSERT_EQ(buf[i], 0);
+    // Small reads add up to the same pace.
+    for (int i = 0; i < 10; ++i) ASSERT_EQ(r->read(buf.data(), 882, true), 882);
+    EXPECT_GE(systemTime(SYSTEM_TIME_MONOTONIC) - t0, 200000000);
+
+    // stop() races one-second reads.
+    r->stop();
     for (int round = 0; round < 20; ++round) {
         ASSERT_EQ(r->start(), OK);
         std::atomic<bool> reading{false};
-        std::vector<int16_t> buf(44100, 1);
+        std::fill(buf.begin(), buf.end(), 1);
         auto reader = std::async(std::launch::async, [&] {
             reading = true;
-            return r->read(buf.data(), buf.size() * 2, true);  // one second unless stopped
+            return r->read(buf.data(), buf.size() * 2, true);
         });
         ASSERT_TRUE(waitUntil([&] { return reading.load(); }));
         if (round % 2) std::this_thread::sleep_for(std::chrono::milliseconds(2));  // vary the race
@@ -268,35 +231,11 @@ TEST_F(RecordTest, StopRacesReadsOnTheNullRoute) {
     }
 }
 
-TEST_F(RecordTest, NullRouteDeliversSilenceAtRealTimePace) {
-    sp<AudioRecord> r = makeRecord();
-    std::vector<int16_t> buf(4410, 123);
-    const nsecs_t t0 = systemTime(SYSTEM_TIME_MONOTONIC);
-    ASSERT_EQ(r->start(), OK);
-    EXPECT_EQ(r->read(buf.data(), buf.size() * 2, true), 8820);
-    const nsecs_t t1 = systemTime(SYSTEM_TIME_MONOTONIC);
-    EXPECT_GE(t1 - t0, 100000000);  // 4410 samples are 100 ms of sound: never sooner
-    for (int16_t s : buf) ASSERT_EQ(s, 0);
-
-    // Small reads add up to the same pace.
-    for (int i = 0; i < 10; ++i) ASSERT_EQ(r->read(buf.data(), 882, true), 882);
-    EXPECT_GE(systemTime(SYSTEM_TIME_MONOTONIC) - t0, 200000000);
-}
-
 TEST_F(RecordTest, WavFileHeardThroughTheStream) {
-    const std::string path = file("mic.wav");
+    const std::string path = mFiles.path("mic.wav");
     std::vector<int16_t> samples(3000);
     for (size_t i = 0; i < samples.size(); ++i) samples[i] = static_cast<int16_t>((i * 2654435761u) >> 16);
-    {
-        SF_INFO info{};
-        info.samplerate = 44100;
-        info.channels = 1;
-        info.format = SF_FORMAT_WAV | SF_FORMAT_PCM_16;
-        SNDFILE* f = sf_open(path.c_str(), SFM_WRITE, &info);
-        ASSERT_NE(f, nullptr);
-        ASSERT_EQ(sf_writef_short(f, samples.data(), static_cast<sf_count_t>(samples.size())), 3000);
-        sf_close(f);
-    }
+    ASSERT_TRUE(writeWav(path, 44100, 1, samples));
     setenv("KORVO_MIC", ("wav:" + path).c_str(), 1);
     test::captureLog(true);
     sp<AudioRecord> r = makeRecord();
@@ -310,40 +249,28 @@ TEST_F(RecordTest, WavFileHeardThroughTheStream) {
     EXPECT_TRUE(std::equal(samples.begin(), samples.end(), heard.begin()));
     for (size_t i = 3000; i < 4000; ++i) ASSERT_EQ(heard[i], 0) << i;  // then silence
     EXPECT_TRUE(test::logLines().empty());
-}
 
-TEST_F(RecordTest, WavFileWithAnotherRateAndChannels) {
-    const std::string path = file("stereo48k.wav");
-    std::vector<int16_t> frames(2 * 500);
-    for (size_t i = 0; i < 500; ++i) {
-        frames[2 * i] = static_cast<int16_t>(i * 13);
-        frames[2 * i + 1] = -1;
-    }
-    {
-        SF_INFO info{};
-        info.samplerate = 48000;
-        info.channels = 2;
-        info.format = SF_FORMAT_WAV | SF_FORMAT_PCM_16;
-        SNDFILE* f = sf_open(path.c_str(), SFM_WRITE, &info);
-        ASSERT_NE(f, nullptr);
-        sf_writef_short(f, frames.data(), 500);
-        sf_close(f);
-    }
-    setenv("KORVO_MIC", ("wav:" + path).c_str(), 1);
-    test::captureLog(true);
-    sp<AudioRecord> r = makeRecord();
-    ASSERT_EQ(r->start(), OK);
-    std::vector<int16_t> heard(600, 1);
-    ASSERT_EQ(r->read(heard.data(), heard.size() * 2, true), 1200);
-    for (size_t i = 0; i < 500; ++i) ASSERT_EQ(heard[i], static_cast<int16_t>(i * 13)) << i;  // first channel
+    // Another rate and two channels: the first channel is heard, each difference logged once.
+    const std::string stereoPath = mFiles.path("stereo48k.wav");
+    std::vector<int16_t> frames(2 * 500, -1);
+    for (size_t i = 0; i < 500; ++i) frames[2 * i] = static_cast<int16_t>(i * 13);
+    ASSERT_TRUE(writeWav(stereoPath, 48000, 2, frames));
+    setenv("KORVO_MIC", ("wav:" + stereoPath).c_str(), 1);
+    sp<AudioRecord> stereo = makeRecord();
+    ASSERT_EQ(stereo->start(), OK);
+    std::fill(heard.begin(), heard.end(), 1);
+    ASSERT_EQ(stereo->read(heard.data(), 1200, true), 1200);
+    for (size_t i = 0; i < 500; ++i) ASSERT_EQ(heard[i], static_cast<int16_t>(i * 13)) << i;
     for (size_t i = 500; i < 600; ++i) ASSERT_EQ(heard[i], 0);
     const auto lines = test::logLines();
     int rateLines = 0;
     for (const auto& l : lines) {
         EXPECT_EQ(l.prio, ANDROID_LOG_ERROR);
         EXPECT_EQ(l.msg.find('\n'), std::string::npos);
-        if (l.msg.find("48000 Hz") != std::string::npos && l.msg.find("rate differs") != std::string::npos) ++rateLines;
+        rateLines += l.msg.find("48000 Hz") != std::string::npos && l.msg.find("rate differs") != std::string::npos;
     }
     EXPECT_EQ(rateLines, 1);
     EXPECT_EQ(lines.size(), 2u);  // the rate, and the channels
 }
+
+}  // namespace

@@ -1,52 +1,31 @@
 // Output track of the platform stand-in: set(), the playback thread and its pace,
 // stop() from the callback or while it blocks, destruction, manual pumping, and the
 // samples that reach the speaker route.
-#include <sndfile.h>
-#include <unistd.h>
-
-#include <atomic>
-#include <chrono>
-#include <cstdint>
-#include <cstdio>
-#include <cstdlib>
 #include <future>
 #include <mutex>
-#include <string>
-#include <thread>
-#include <vector>
 
-#include <gtest/gtest.h>
-
-#include <korvo/platform/TestControl.h>
 #include <log/log.h>
 #include <media/AudioSystem.h>
 #include <media/AudioTrack.h>
 
-#include "support/ToneTestSupport.h"
+#include "support/PlatformTestSupport.h"
+
+using namespace android;
+using namespace korvo::platformtest;
 
 namespace {
 
-namespace test = korvo::platform::test;
-using android::AudioSystem;
-using android::AudioTrack;
-using android::sp;
-using android::status_t;
-using korvo::tonetest::waitUntil;
-
 // What a test's callback sees and does.
 struct Probe {
-    std::atomic<int> calls{0};
-    std::atomic<int> badEvents{0};
-    std::atomic<size_t> lastSize{0};
-    std::atomic<size_t> lastFrames{0};
-    std::atomic<bool> calledWhileStopped{false};
+    std::atomic<int> calls{0}, badEvents{0};
+    std::atomic<size_t> lastSize{0}, lastFrames{0};
+    std::atomic<bool> calledWhileStopped{false}, entered{false};
     std::atomic<std::thread::id> lastThread{};
-    int stopAt = 0;             // stop() the track from inside call n
-    int dropAt = 0;             // drop the last reference from inside call n
-    int emptyAt = 0;            // report nothing produced in call n
-    size_t shortBytes = 0;      // report only this many bytes (0: all)
+    int stopAt = 0;              // stop() the track from inside call n
+    int dropAt = 0;              // drop the last reference from inside call n
+    int emptyAt = 0;             // report nothing produced in call n
+    size_t shortBytes = 0;       // report only this many bytes (0: all)
     std::mutex* gate = nullptr;  // taken in every call
-    std::atomic<bool> entered{false};
     AudioTrack* track = nullptr;
     sp<AudioTrack> owner;
 };
@@ -60,9 +39,7 @@ void probeCallback(int event, void* user, void* info) {
     }
     if (p->track != nullptr && p->track->stopped()) p->calledWhileStopped = true;
     p->entered = true;
-    if (p->gate) {
-        std::lock_guard<std::mutex> lk(*p->gate);
-    }
+    if (p->gate) std::lock_guard<std::mutex> lk(*p->gate);
     AudioTrack::Buffer* b = static_cast<AudioTrack::Buffer*>(info);
     int call = ++p->calls;
     p->lastSize = b->size;
@@ -75,9 +52,12 @@ void probeCallback(int event, void* user, void* info) {
     if (call == p->dropAt) p->owner.clear();
 }
 
-std::vector<int16_t> probeSamples(int call, size_t n) {
-    std::vector<int16_t> s(n);
-    for (size_t i = 0; i < n; ++i) s[i] = static_cast<int16_t>(call * 1000 + static_cast<int>(i));
+// The samples of the given calls' buffers (call, samples) joined in order; call 0 is silence.
+std::vector<int16_t> probeSamples(std::initializer_list<std::pair<int, size_t>> calls) {
+    std::vector<int16_t> s;
+    for (const auto& [call, n] : calls) {
+        for (size_t i = 0; i < n; ++i) s.push_back(static_cast<int16_t>(call ? call * 1000 + static_cast<int>(i) : 0));
+    }
     return s;
 }
 
@@ -87,130 +67,100 @@ status_t setUp(AudioTrack& t, Probe* p, uint32_t rate = 0) {
                  AudioTrack::TRANSFER_CALLBACK, nullptr, -1, -1, nullptr, false, 1.0f);
 }
 
-class PlatformTrackTest : public ::testing::Test {
-protected:
-    void SetUp() override {
-        test::resetAll();
-        test::captureLog(true);
-        test::clearLog();
-        const char* old = getenv("KORVO_SPEAKER");
-        mHadSpeaker = old != nullptr;
-        if (old) mOldSpeaker = old;
-        unsetenv("KORVO_SPEAKER");
-    }
-    void TearDown() override {
-        if (mHadSpeaker) {
-            setenv("KORVO_SPEAKER", mOldSpeaker.c_str(), 1);
-        } else {
-            unsetenv("KORVO_SPEAKER");
-        }
-        test::resetAll();
-    }
-    std::string mOldSpeaker;
-    bool mHadSpeaker = false;
-};
+// A track set up for `p`, which it also records as the track to stop from the callback.
+sp<AudioTrack> trackFor(Probe& p) {
+    sp<AudioTrack> t = new AudioTrack();
+    p.track = t.get();
+    EXPECT_EQ(setUp(*t, &p), OK);
+    return t;
+}
 
-TEST_F(PlatformTrackTest, OutputSamplingRate) {
+using PlatformTrackTest = PlatformFixture;
+
+TEST_F(PlatformTrackTest, OutputRateSetInitCheckAndBadRoute) {
     uint32_t rate = 1;
-    EXPECT_EQ(AudioSystem::getOutputSamplingRate(&rate, AUDIO_STREAM_MUSIC), android::OK);
+    EXPECT_EQ(AudioSystem::getOutputSamplingRate(&rate, AUDIO_STREAM_MUSIC), OK);
     EXPECT_EQ(rate, 44100u);
-    EXPECT_EQ(AudioSystem::getOutputSamplingRate(nullptr), android::BAD_VALUE);
+    EXPECT_EQ(AudioSystem::getOutputSamplingRate(nullptr), BAD_VALUE);
     test::setOutputSamplingRate(48000);
-    EXPECT_EQ(AudioSystem::getOutputSamplingRate(&rate), android::OK);
+    EXPECT_EQ(AudioSystem::getOutputSamplingRate(&rate), OK);
     EXPECT_EQ(rate, 48000u);
-    test::failOutputSamplingRate(android::NO_INIT);
+    test::failOutputSamplingRate(NO_INIT);
     rate = 7;
-    EXPECT_EQ(AudioSystem::getOutputSamplingRate(&rate), android::NO_INIT);
+    EXPECT_EQ(AudioSystem::getOutputSamplingRate(&rate), NO_INIT);
     EXPECT_EQ(rate, 7u);
     test::resetAll();
-    EXPECT_EQ(AudioSystem::getOutputSamplingRate(&rate), android::OK);
+    EXPECT_EQ(AudioSystem::getOutputSamplingRate(&rate), OK);
     EXPECT_EQ(rate, 44100u);
-}
 
-TEST_F(PlatformTrackTest, SetAndInitCheck) {
-    Probe p;
-    {
-        sp<AudioTrack> t = new AudioTrack();
-        EXPECT_EQ(t->initCheck(), android::NO_INIT);  // not set yet
-        EXPECT_EQ(setUp(*t, &p), android::OK);
-        EXPECT_EQ(t->initCheck(), android::OK);
-        EXPECT_EQ(t->getSampleRate(), 44100u);
-        EXPECT_TRUE(t->stopped());
-        EXPECT_EQ(setUp(*t, &p), android::INVALID_OPERATION);  // set once
-        // The volume is kept, the samples are not scaled.
-        EXPECT_EQ(t->setVolume(0.8f), android::OK);
-        EXPECT_FLOAT_EQ(t->getVolume(), 0.8f);
-        EXPECT_EQ(t->setVolume(1.5f), android::BAD_VALUE);
-        EXPECT_FLOAT_EQ(t->getVolume(), 0.8f);
-    }
-    {
-        test::setOutputSamplingRate(48000);
-        sp<AudioTrack> t = new AudioTrack();
-        EXPECT_EQ(setUp(*t, &p), android::OK);
-        EXPECT_EQ(t->getSampleRate(), 48000u);
-        sp<AudioTrack> u = new AudioTrack();
-        EXPECT_EQ(setUp(*u, &p, 22050), android::OK);  // an explicit rate wins
-        EXPECT_EQ(u->getSampleRate(), 22050u);
-        test::setOutputSamplingRate(0);
-    }
-    {
-        test::failTrackSet(android::NO_INIT);
-        sp<AudioTrack> t = new AudioTrack();
-        EXPECT_EQ(setUp(*t, &p), android::NO_INIT);
-        EXPECT_EQ(t->initCheck(), android::NO_INIT);
-        EXPECT_EQ(t->start(), android::NO_INIT);
-        test::failTrackSet(0);
-    }
-    {
-        test::failTrackInitCheck(android::BAD_VALUE);
-        sp<AudioTrack> t = new AudioTrack();
-        EXPECT_EQ(setUp(*t, &p), android::OK);
-        EXPECT_EQ(t->initCheck(), android::BAD_VALUE);
-        test::failTrackInitCheck(0);
-        EXPECT_EQ(t->initCheck(), android::OK);
-    }
-    {
-        // Only mono 16-bit.
-        sp<AudioTrack> t = new AudioTrack();
-        EXPECT_EQ(t->set(AUDIO_STREAM_MUSIC, 0, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_OUT_STEREO),
-                  android::BAD_VALUE);
-        EXPECT_EQ(t->initCheck(), android::BAD_VALUE);
-    }
-    {
-        // Rate 0 with the output's rate unknown: set fails with the platform's status.
-        test::failOutputSamplingRate(android::DEAD_OBJECT);
-        sp<AudioTrack> t = new AudioTrack();
-        EXPECT_EQ(setUp(*t, &p), android::DEAD_OBJECT);
-        EXPECT_EQ(t->initCheck(), android::DEAD_OBJECT);
-        test::failOutputSamplingRate(0);
-    }
-    EXPECT_EQ(test::tracksCreated(), 7);
-    EXPECT_EQ(p.calls, 0);
-}
-
-TEST_F(PlatformTrackTest, BadRouteText) {
-    setenv("KORVO_SPEAKER", "loudspeaker", 1);
     Probe p;
     sp<AudioTrack> t = new AudioTrack();
-    test::clearLog();
-    EXPECT_EQ(setUp(*t, &p), android::BAD_VALUE);
-    EXPECT_EQ(t->initCheck(), android::BAD_VALUE);
+    EXPECT_EQ(t->initCheck(), NO_INIT);  // not set yet
+    EXPECT_EQ(setUp(*t, &p), OK);
+    EXPECT_EQ(t->initCheck(), OK);
+    EXPECT_EQ(t->getSampleRate(), 44100u);
+    EXPECT_TRUE(t->stopped());
+    EXPECT_EQ(setUp(*t, &p), INVALID_OPERATION);  // set once
+    // The volume is kept, the samples are not scaled.
+    EXPECT_EQ(t->setVolume(0.8f), OK);
+    EXPECT_FLOAT_EQ(t->getVolume(), 0.8f);
+    EXPECT_EQ(t->setVolume(1.5f), BAD_VALUE);
+    EXPECT_FLOAT_EQ(t->getVolume(), 0.8f);
+
+    test::setOutputSamplingRate(48000);
+    t = new AudioTrack();
+    EXPECT_EQ(setUp(*t, &p), OK);
+    EXPECT_EQ(t->getSampleRate(), 48000u);
+    t = new AudioTrack();
+    EXPECT_EQ(setUp(*t, &p, 22050), OK);  // an explicit rate wins
+    EXPECT_EQ(t->getSampleRate(), 22050u);
+    test::setOutputSamplingRate(0);
+
+    t = new AudioTrack();  // only mono 16-bit
+    EXPECT_EQ(t->set(AUDIO_STREAM_MUSIC, 0, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_OUT_STEREO), BAD_VALUE);
+    EXPECT_EQ(t->initCheck(), BAD_VALUE);
+
+    // Forced failures of set, of initCheck, and of the output rate that rate 0 needs.
+    struct Forced {
+        void (*force)(status_t);
+        status_t status, set, init;
+    };
+    for (const Forced& row : {Forced{test::failTrackSet, NO_INIT, NO_INIT, NO_INIT},
+                              Forced{test::failTrackInitCheck, BAD_VALUE, OK, BAD_VALUE},
+                              Forced{test::failOutputSamplingRate, DEAD_OBJECT, DEAD_OBJECT, DEAD_OBJECT}}) {
+        row.force(row.status);
+        t = new AudioTrack();
+        EXPECT_EQ(setUp(*t, &p), row.set);
+        EXPECT_EQ(t->initCheck(), row.init);
+        if (row.set != OK) {
+            EXPECT_EQ(t->start(), row.set);  // a track that was not set does not start
+        }
+        row.force(0);
+        EXPECT_EQ(t->initCheck(), row.set);  // a forced initCheck lasts while forced
+    }
+    EXPECT_EQ(test::tracksCreated(), 7);
+
+    // A bad route text: set fails and says why.
+    setenv("KORVO_SPEAKER", "loudspeaker", 1);
+    test::captureLog(true);
+    t = new AudioTrack();
+    EXPECT_EQ(setUp(*t, &p), BAD_VALUE);
+    EXPECT_EQ(t->initCheck(), BAD_VALUE);
     std::vector<test::LogLine> lines = test::logLines();
     ASSERT_EQ(lines.size(), 1u);
     EXPECT_EQ(lines[0].tag, "AudioTrack");
     EXPECT_EQ(lines[0].prio, ANDROID_LOG_ERROR);
     EXPECT_NE(lines[0].msg.find("loudspeaker"), std::string::npos) << lines[0].msg;
-    EXPECT_EQ(t->start(), android::BAD_VALUE);
+    EXPECT_EQ(t->start(), BAD_VALUE);
     EXPECT_FALSE(test::trackPlaying());
+    EXPECT_EQ(p.calls, 0);
 }
 
 TEST_F(PlatformTrackTest, PlaybackThreadPacesTheCallbacks) {
     Probe p;
-    sp<AudioTrack> t = new AudioTrack();
-    p.track = t.get();
-    ASSERT_EQ(setUp(*t, &p), android::OK);
+    sp<AudioTrack> t = trackFor(p);
     auto t0 = std::chrono::steady_clock::now();
-    ASSERT_EQ(t->start(), android::OK);
+    ASSERT_EQ(t->start(), OK);
     EXPECT_TRUE(test::trackPlaying());
     EXPECT_FALSE(t->stopped());
     ASSERT_TRUE(waitUntil([&] { return p.calls >= 11; }));
@@ -233,41 +183,35 @@ TEST_F(PlatformTrackTest, PlaybackThreadPacesTheCallbacks) {
     EXPECT_EQ(test::trackStops(), 1);
 }
 
-TEST_F(PlatformTrackTest, StopFromInsideTheCallback) {
+TEST_F(PlatformTrackTest, StopFromInsideTheCallbackOrWhileItBlocks) {
     Probe p;
     p.stopAt = 3;
-    sp<AudioTrack> t = new AudioTrack();
-    p.track = t.get();
-    ASSERT_EQ(setUp(*t, &p), android::OK);
-    ASSERT_EQ(t->start(), android::OK);
+    sp<AudioTrack> t = trackFor(p);
+    ASSERT_EQ(t->start(), OK);
     ASSERT_TRUE(test::waitTrackStopped(5000));
     EXPECT_EQ(p.calls, 3);
     // Nothing more arrives while stopped (a bounded look for what must not happen).
     EXPECT_FALSE(waitUntil([&] { return p.calls > 3; }, 100));
     // start() resumes the same thread.
-    ASSERT_EQ(t->start(), android::OK);
+    ASSERT_EQ(t->start(), OK);
     ASSERT_TRUE(waitUntil([&] { return p.calls >= 6; }));
     EXPECT_FALSE(p.calledWhileStopped);
     t->stop();
-}
 
-TEST_F(PlatformTrackTest, StopNeverWaitsForABlockedCallback) {
+    // stop() never waits for a callback that blocks on a gate this thread holds.
     std::mutex gate;
-    Probe p;
-    p.gate = &gate;
-    sp<AudioTrack> t = new AudioTrack();
-    p.track = t.get();
-    ASSERT_EQ(setUp(*t, &p), android::OK);
+    Probe q;
+    q.gate = &gate;
+    sp<AudioTrack> u = trackFor(q);
     std::unique_lock<std::mutex> held(gate);
-    ASSERT_EQ(t->start(), android::OK);
-    ASSERT_TRUE(waitUntil([&] { return p.entered.load(); }));
-    // The callback now waits for the gate, which this thread holds.
-    auto stopped = std::async(std::launch::async, [&] { t->stop(); });
+    ASSERT_EQ(u->start(), OK);
+    ASSERT_TRUE(waitUntil([&] { return q.entered.load(); }));
+    auto stopped = std::async(std::launch::async, [&] { u->stop(); });
     EXPECT_EQ(stopped.wait_for(std::chrono::seconds(2)), std::future_status::ready);
     held.unlock();
     stopped.wait();
-    EXPECT_TRUE(t->stopped());
-    EXPECT_TRUE(waitUntil([&] { return p.calls >= 1; }));
+    EXPECT_TRUE(u->stopped());
+    EXPECT_TRUE(waitUntil([&] { return q.calls >= 1; }));
 }
 
 TEST_F(PlatformTrackTest, DestructionJoinsOrDetaches) {
@@ -275,37 +219,34 @@ TEST_F(PlatformTrackTest, DestructionJoinsOrDetaches) {
         // Destroyed while playing: the thread is joined, no callback follows.
         Probe p;
         sp<AudioTrack> t = new AudioTrack();
-        ASSERT_EQ(setUp(*t, &p), android::OK);
-        ASSERT_EQ(t->start(), android::OK);
+        ASSERT_EQ(setUp(*t, &p), OK);
+        ASSERT_EQ(t->start(), OK);
         ASSERT_TRUE(waitUntil([&] { return p.calls >= 2; }));
         t.clear();
         int after = p.calls;
         EXPECT_FALSE(waitUntil([&] { return p.calls > after; }, 60));
     }
-    {
-        // The callback drops the last reference: the track goes on its own thread.
-        Probe p;
-        p.dropAt = 2;
-        p.owner = new AudioTrack();
-        ASSERT_EQ(setUp(*p.owner, &p), android::OK);
-        ASSERT_EQ(p.owner->start(), android::OK);
-        ASSERT_TRUE(waitUntil([&] { return p.calls >= 2; }));
-        EXPECT_FALSE(waitUntil([&] { return p.calls > 2; }, 60));
-        EXPECT_FALSE(test::trackPlaying());
-    }
+    // The callback drops the last reference: the track goes on its own thread.
+    Probe p;
+    p.dropAt = 2;
+    p.owner = new AudioTrack();
+    ASSERT_EQ(setUp(*p.owner, &p), OK);
+    ASSERT_EQ(p.owner->start(), OK);
+    ASSERT_TRUE(waitUntil([&] { return p.calls >= 2; }));
+    EXPECT_FALSE(waitUntil([&] { return p.calls > 2; }, 60));
+    EXPECT_FALSE(test::trackPlaying());
 }
 
 TEST_F(PlatformTrackTest, ManualPumping) {
     test::manualTrackCallbacks(true);
     Probe pa, pb;
-    sp<AudioTrack> a = new AudioTrack();
-    sp<AudioTrack> b = new AudioTrack();
-    ASSERT_EQ(setUp(*a, &pa), android::OK);
-    ASSERT_EQ(setUp(*b, &pb), android::OK);
+    sp<AudioTrack> a = new AudioTrack(), b = new AudioTrack();
+    ASSERT_EQ(setUp(*a, &pa), OK);
+    ASSERT_EQ(setUp(*b, &pb), OK);
     EXPECT_FALSE(test::pumpTrack().called);  // nothing started
 
-    ASSERT_EQ(a->start(), android::OK);
-    ASSERT_EQ(b->start(), android::OK);
+    ASSERT_EQ(a->start(), OK);
+    ASSERT_EQ(b->start(), OK);
     EXPECT_FALSE(waitUntil([&] { return pa.calls + pb.calls > 0; }, 60));  // no thread
 
     // The newest started track, on the calling thread.
@@ -315,19 +256,18 @@ TEST_F(PlatformTrackTest, ManualPumping) {
     EXPECT_EQ(pa.calls, 0);
     EXPECT_EQ(pb.lastThread.load(), std::this_thread::get_id());
     EXPECT_EQ(r.sizeBytes, 1764u);
-    EXPECT_EQ(r.samples, probeSamples(1, 882));
+    EXPECT_EQ(r.samples, probeSamples({{1, 882}}));
     r = test::pumpTrack(100);
     EXPECT_EQ(r.sizeBytes, 200u);
-    EXPECT_EQ(r.samples, probeSamples(2, 100));
+    EXPECT_EQ(r.samples, probeSamples({{2, 100}}));
 
     // The newest track is stopped: no fallback to an older one.
     b->stop();
     EXPECT_TRUE(test::waitTrackStopped(0));
     EXPECT_FALSE(test::pumpTrack().called);
     EXPECT_FALSE(test::trackPlaying());
-    ASSERT_EQ(a->start(), android::OK);
-    r = test::pumpTrack();
-    EXPECT_TRUE(r.called);
+    ASSERT_EQ(a->start(), OK);
+    EXPECT_TRUE(test::pumpTrack().called);
     EXPECT_EQ(pa.calls, 1);
     EXPECT_FALSE(test::trackPlaying());  // the newest created track (b) is stopped
     b.clear();
@@ -337,11 +277,9 @@ TEST_F(PlatformTrackTest, ManualPumping) {
     EXPECT_EQ(test::trackStops(), 1);
 
     // A track destroyed while another thread pumps it.
-    std::atomic<bool> done{false};
     auto pumper = std::async(std::launch::async, [&] {
         int n = 0;
         while (test::pumpTrack(64).called) ++n;
-        done = true;
         return n;
     });
     ASSERT_TRUE(waitUntil([&] { return pa.calls >= 4; }));
@@ -354,46 +292,32 @@ TEST_F(PlatformTrackTest, ManualPumping) {
 }
 
 TEST_F(PlatformTrackTest, SamplesReachTheWavRouteUnchanged) {
-    std::string path = "/tmp/korvo_track_wav_" + std::to_string(getpid()) + ".wav";
+    const std::string path = mFiles.path("out.wav");
     setenv("KORVO_SPEAKER", ("wav:" + path).c_str(), 1);
     test::manualTrackCallbacks(true);
     {
         Probe p;
         p.emptyAt = 3;
-        sp<AudioTrack> t = new AudioTrack();
-        ASSERT_EQ(setUp(*t, &p), android::OK);
-        ASSERT_EQ(t->setVolume(0.8f), android::OK);
-        ASSERT_EQ(t->start(), android::OK);
+        sp<AudioTrack> t = trackFor(p);
+        ASSERT_EQ(t->setVolume(0.8f), OK);
+        ASSERT_EQ(t->start(), OK);
         test::pumpTrack();  // call 1: 882 samples
         test::pumpTrack();  // call 2
         test::pumpTrack();  // call 3 produces nothing: silence of the buffer length
         p.shortBytes = 100;
         test::pumpTrack();  // call 4: only 50 samples
     }
-    SF_INFO info{};
-    SNDFILE* f = sf_open(path.c_str(), SFM_READ, &info);
-    ASSERT_NE(f, nullptr) << sf_strerror(nullptr);
-    std::vector<int16_t> s(static_cast<size_t>(info.frames));
-    sf_readf_short(f, s.data(), info.frames);
-    sf_close(f);
-    std::remove(path.c_str());
-
-    std::vector<int16_t> want = probeSamples(1, 882);
-    std::vector<int16_t> two = probeSamples(2, 882);
-    want.insert(want.end(), two.begin(), two.end());
-    want.insert(want.end(), 882, 0);
-    std::vector<int16_t> four = probeSamples(4, 50);
-    want.insert(want.end(), four.begin(), four.end());
-    EXPECT_EQ(info.samplerate, 44100);
-    EXPECT_EQ(s, want);
+    const auto wav = readWav(path);
+    ASSERT_TRUE(wav.ok);
+    EXPECT_EQ(wav.rate, 44100);
+    EXPECT_EQ(wav.samples, probeSamples({{1, 882}, {2, 882}, {0, 882}, {4, 50}}));
 }
 
 TEST_F(PlatformTrackTest, PausedThreadsMakeNoCallbacks) {
     Probe p;
-    sp<AudioTrack> t = new AudioTrack();
-    ASSERT_EQ(setUp(*t, &p), android::OK);
+    sp<AudioTrack> t = trackFor(p);
     test::pauseTrackCallbacks(true);
-    ASSERT_EQ(t->start(), android::OK);
+    ASSERT_EQ(t->start(), OK);
     EXPECT_FALSE(waitUntil([&] { return p.calls > 0; }, 100));
     EXPECT_TRUE(test::trackPlaying());
     // resetAll lifts the pause.
