@@ -8,11 +8,13 @@
 #include <cmath>
 #include <cstring>
 #include <ctime>
+#include <string>
 #include <thread>
 #include <vector>
 
 #include "analysis/WaveformCanvas.h"
 #include "capture/FrameExchange.h"
+#include "support/DspTestSupport.h"
 
 namespace kt = korvo::platform::test;
 
@@ -25,14 +27,22 @@ struct WaveformCanvasTestAccess {
 using android::sp;
 using android::WaveformCanvas;
 using android::WaveformCanvasTestAccess;
+using korvo::dsptest::stdoutOf;
 
 namespace {
 
-void putTone(int16_t* frame, int bin, double amplitude) {
-    for (int j = 0; j < 512; ++j) {
-        frame[j] = static_cast<int16_t>(
-            std::lround(amplitude * 32767.0 * std::sin(2.0 * M_PI * bin * j / 512.0)));
+// Publishes a record whose five slots hold a tone on bin(k).
+template <class BinOf>
+void publishTones(BinOf bin, double amplitude, int count, int index = 0) {
+    Mmic_data_t rec;
+    std::memset(&rec, 0, sizeof rec);
+    for (int k = 0; k < 5; ++k) {
+        const std::vector<short> tone = korvo::dsptest::toneFrame(bin(k), amplitude);
+        std::copy(tone.begin(), tone.end(), &rec.data[512 * k]);
     }
+    rec.index = index;
+    rec.count = count;
+    read_write_audio(nullptr, 1, &rec);
 }
 
 int strongestBin(const WaveformCanvas& w) {
@@ -40,16 +50,14 @@ int strongestBin(const WaveformCanvas& w) {
     return static_cast<int>(std::max_element(d + 1, d + 256) - d);
 }
 
-class AnalysisThreadTest : public ::testing::Test {
+class AnalysisThreadTest : public korvo::dsptest::LoggedTest {
 protected:
     void SetUp() override {
-        kt::resetAll();
-        // Written before the capture starts: the process's first exchange logs its own line.
+        LoggedTest::SetUp();
         Mmic_data_t zero;
         std::memset(&zero, 0, sizeof zero);
         read_write_audio(nullptr, 1, &zero);
-        kt::captureLog(true);
-        kt::clearLog();
+        kt::clearLog();  // the process's first exchange logs its own line
     }
 };
 
@@ -63,20 +71,18 @@ TEST_F(AnalysisThreadTest, NewObjectFields) {
     EXPECT_EQ(w->getDetectionLevel(), 0);
     EXPECT_EQ(w->rwFlag, 0);
     ASSERT_NE(w->spectrum, nullptr);
-    ASSERT_EQ(w->spectrum->length, 256);
-    for (int i = 0; i < 256; ++i) EXPECT_EQ(w->spectrum->data[i], 0.0);
     ASSERT_NE(w->history, nullptr);
+    EXPECT_EQ(std::vector<double>(w->spectrum->data, w->spectrum->data + w->spectrum->length),
+              std::vector<double>(256, 0.0));
     EXPECT_EQ(w->history->length, 256);
     EXPECT_EQ(w->history->width, 1);
-    for (int i = 0; i < 256; ++i) EXPECT_EQ(w->history->data[i], 0.0);
+    EXPECT_EQ(std::vector<double>(w->history->data, w->history->data + 256), std::vector<double>(256, 0.0));
     EXPECT_FALSE(w->isRunning());
 
     // init_variables puts fresh tables in place and clears the level and history slot.
     sp<WaveTable_Double> old = w->spectrum;
     w->historyIndex = 3;
-    testing::internal::CaptureStdout();
-    w->setDetectionLevel(12);
-    testing::internal::GetCapturedStdout();
+    stdoutOf([&] { w->setDetectionLevel(12); });
     w->init_variables();
     EXPECT_NE(w->spectrum.get(), old.get());
     EXPECT_EQ(w->historyIndex, 0);
@@ -85,13 +91,7 @@ TEST_F(AnalysisThreadTest, NewObjectFields) {
 
 TEST_F(AnalysisThreadTest, TurnsFollowTheirOwnSlotCounter) {
     // Slot k holds a tone on bin 20 + 10k; the record claims slot 3 throughout.
-    Mmic_data_t rec;
-    std::memset(&rec, 0, sizeof rec);
-    for (int k = 0; k < 5; ++k) putTone(&rec.data[512 * k], 20 + 10 * k, 0.5);
-    rec.index = 3;
-    rec.count = 512;
-    read_write_audio(nullptr, 1, &rec);
-
+    publishTones([](int k) { return 20 + 10 * k; }, 0.5, 512, 3);
     sp<WaveformCanvas> w = new WaveformCanvas();
     std::vector<int> before, analysed;
     for (int t = 0; t < 6; ++t) {
@@ -105,8 +105,7 @@ TEST_F(AnalysisThreadTest, TurnsFollowTheirOwnSlotCounter) {
 
     // A count beyond the copied ring is cut at its end: slot 4 with count 700 analyses
     // the slot itself and reads nothing past the copy.
-    rec.count = 700;
-    read_write_audio(nullptr, 1, &rec);
+    publishTones([](int k) { return 20 + 10 * k; }, 0.5, 700, 3);
     w->frameIndex = 4;
     EXPECT_TRUE(WaveformCanvasTestAccess::turn(*w));
     EXPECT_EQ(strongestBin(*w), 60);
@@ -127,12 +126,10 @@ TEST_F(AnalysisThreadTest, TurnWakesTheCaptureLoop) {
         pthread_mutex_unlock(&AudioBufferLock);
     });
     // Holding the lock with `waiting` set means the waiter sits in its timed wait.
-    for (;;) {
+    for (bool ready = false; !ready; std::this_thread::yield()) {
         pthread_mutex_lock(&AudioBufferLock);
-        const bool ready = waiting;
+        ready = waiting;
         pthread_mutex_unlock(&AudioBufferLock);
-        if (ready) break;
-        std::this_thread::yield();
     }
     const auto start = std::chrono::steady_clock::now();
     EXPECT_TRUE(WaveformCanvasTestAccess::turn(*w));
@@ -143,9 +140,7 @@ TEST_F(AnalysisThreadTest, TurnWakesTheCaptureLoop) {
 
 TEST_F(AnalysisThreadTest, DetectionLevelAndRelease) {
     sp<WaveformCanvas> w = new WaveformCanvas();
-    testing::internal::CaptureStdout();
-    w->setDetectionLevel(-5);
-    EXPECT_EQ(testing::internal::GetCapturedStdout(), "[WAVEFORM_CANVAS] detection Level is -5\n");
+    EXPECT_EQ(stdoutOf([&] { w->setDetectionLevel(-5); }), "[WAVEFORM_CANVAS] detection Level is -5\n");
     EXPECT_EQ(w->getDetectionLevel(), -5);
     w->setActive(true);
     EXPECT_TRUE(w->active.load());
@@ -159,37 +154,25 @@ TEST_F(AnalysisThreadTest, DetectionLevelAndRelease) {
     EXPECT_NEAR(out[40], -3.0f, 1e-4);
 
     w->release();
-    const auto lines = kt::logLines();
-    ASSERT_EQ(lines.size(), 2u);
-    EXPECT_EQ(lines[0].prio, 6);
-    EXPECT_EQ(lines[0].tag, "TQX");
-    EXPECT_EQ(lines[0].msg, "[WAVEFORM_CANVAS] detection Level is -5");
-    EXPECT_EQ(lines[1].prio, 3);
-    EXPECT_EQ(lines[1].tag, "TQX");
-    EXPECT_EQ(lines[1].msg, "[WAVEFORM_CANVAS] WaveformCanvas Relese");
+    std::vector<std::string> lines;  // priority, tag, message
+    for (const auto& l : kt::logLines()) lines.push_back(std::to_string(l.prio) + " " + l.tag + " " + l.msg);
+    EXPECT_EQ(lines, (std::vector<std::string>{"6 TQX [WAVEFORM_CANVAS] detection Level is -5",
+                                               "3 TQX [WAVEFORM_CANVAS] WaveformCanvas Relese"}));
 }
 
 TEST_F(AnalysisThreadTest, RunningThreadAnalysesThePublishedTone) {
-    Mmic_data_t rec;
-    std::memset(&rec, 0, sizeof rec);
-    for (int k = 0; k < 5; ++k) putTone(&rec.data[512 * k], 47, 0.3);
-    rec.count = 512;
-    read_write_audio(nullptr, 1, &rec);
-
+    publishTones([](int) { return 47; }, 0.3, 512);
     sp<WaveformCanvas> w = new WaveformCanvas();
     sp<WaveTable_Double> table = w->spectrum;
     ASSERT_EQ(w->run("WaveformCanvas", 0, 0), android::OK);
     std::vector<float> out(256, 0.0f);
     int strongest = -1;
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);
-    while (std::chrono::steady_clock::now() < deadline) {
-        std::fill(out.begin(), out.end(), 0.0f);
-        if (w->getSpectrumData(out.data()) > 0) {
-            strongest =
-                static_cast<int>(std::max_element(out.begin() + 1, out.end()) - out.begin());
-            if (strongest == 47) break;
-        }
+    while (strongest != 47 && std::chrono::steady_clock::now() < deadline) {
         std::this_thread::sleep_for(std::chrono::milliseconds(5));
+        std::fill(out.begin(), out.end(), 0.0f);
+        if (w->getSpectrumData(out.data()) > 0)
+            strongest = static_cast<int>(std::max_element(out.begin() + 1, out.end()) - out.begin());
     }
     EXPECT_EQ(strongest, 47);
 
@@ -200,16 +183,12 @@ TEST_F(AnalysisThreadTest, RunningThreadAnalysesThePublishedTone) {
     std::fill(out.begin(), out.end(), 0.0f);
     w->getSpectrumData(out.data());
     EXPECT_GT(out[47], 80.0f);
-
     EXPECT_EQ(w->requestExitAndWait(), android::OK);
     EXPECT_FALSE(w->isRunning());
-}
 
-TEST_F(AnalysisThreadTest, DroppingARunningThreadStopsItFirst) {
-    sp<WaveformCanvas> w = new WaveformCanvas();
-    ASSERT_EQ(w->run("WaveformCanvas", 0, 0), android::OK);
-    std::vector<float> out(256);
-    w->getSpectrumData(out.data());
-    w.clear();  // the destructor ends the loop before the tables go
-    SUCCEED();
+    // Dropping a running thread: the destructor ends the loop before the tables go.
+    sp<WaveformCanvas> dropped = new WaveformCanvas();
+    ASSERT_EQ(dropped->run("WaveformCanvas", 0, 0), android::OK);
+    dropped->getSpectrumData(out.data());
+    dropped.clear();
 }

@@ -9,10 +9,10 @@
 #include <vector>
 
 #include "analysis/WaveformCanvas.h"
+#include "support/DspTestSupport.h"
 
 using android::sp;
 using android::WaveformCanvas;
-namespace kt = korvo::platform::test;
 
 namespace {
 
@@ -26,83 +26,66 @@ struct GuardedOut {
     bool guardsIntact() const { return buf.front() == kSentinel && buf.back() == kSentinel; }
 };
 
-// Entries that can carry a level in the masked layout: 26, 27, then every decade's
-// x0 and x3..x7 up to 200.
-std::set<int> maskedEntries() {
-    std::set<int> s = {26, 27};
-    for (int d = 3; d <= 20; ++d) s.insert(10 * d);
-    for (int d = 3; d <= 19; ++d)
-        for (int u = 3; u <= 7; ++u) s.insert(10 * d + u);
-    return s;
-}
+// (20 log10 m + 120) / 1.2: the level unit is 1.2 dB of magnitude, 0 at 1e-6.
+double levelOf(double m) { return (20.0 * std::log10(m) + 120.0) / 1.2; }
 
-class SpectrumReadoutTest : public ::testing::Test {
+class SpectrumReadoutTest : public korvo::dsptest::LoggedTest {
 protected:
     void SetUp() override {
-        kt::resetAll();
+        LoggedTest::SetUp();
         canvas = new WaveformCanvas();
     }
     void setBin(int i, double m) { canvas->spectrum->data[i] = m; }
+    void setLevel(int level) {
+        korvo::dsptest::stdoutOf([&] { canvas->setDetectionLevel(level); });
+    }
+    // Runs a read-out; every entry below `from` must keep the sentinel, and so must the guards.
+    GuardedOut readOut(bool masked, int wantCount) {
+        GuardedOut a;
+        EXPECT_EQ(masked ? canvas->getSpectrumData_zorv(a.out()) : canvas->getSpectrumData(a.out()), wantCount);
+        for (int i = 0; i < (masked ? 2 : 1); ++i) EXPECT_EQ(a[i], kSentinel) << i;
+        EXPECT_TRUE(a.guardsIntact());
+        return a;
+    }
     sp<WaveformCanvas> canvas;
 };
 
 }  // namespace
 
 TEST_F(SpectrumReadoutTest, EmptySpectrumReportsNothing) {
-    GuardedOut a, b;
-    EXPECT_EQ(canvas->getSpectrumData(a.out()), 0);
-    EXPECT_EQ(canvas->getSpectrumData_zorv(b.out()), 0);
-    EXPECT_EQ(a[0], kSentinel);
+    const GuardedOut a = readOut(false, 0), b = readOut(true, 0);
     for (int i = 1; i < 256; ++i) EXPECT_EQ(a[i], 0.0f) << i;
-    EXPECT_EQ(b[0], kSentinel);
-    EXPECT_EQ(b[1], kSentinel);
     for (int i = 2; i < 256; ++i) EXPECT_EQ(b[i], 0.0f) << i;
-    EXPECT_TRUE(a.guardsIntact());
-    EXPECT_TRUE(b.guardsIntact());
 }
 
 TEST_F(SpectrumReadoutTest, ExactLevels) {
-    setBin(10, 1.0);
-    setBin(11, 0.01);
-    setBin(12, 1e-6);
-    setBin(13, 1e-3);
+    const std::vector<std::pair<double, float>> bins = {{1.0, 100.0f}, {0.01, 66.66667f}, {1e-6, 0.0f}, {1e-3, 50.0f}};
+    for (size_t k = 0; k < bins.size(); ++k) setBin(10 + static_cast<int>(k), bins[k].first);
     setBin(14, 10.0);
     setBin(0, 1.0);  // bin 0 is never reported
-    GuardedOut a;
-    EXPECT_EQ(canvas->getSpectrumData(a.out()), 4);
-    EXPECT_EQ(a[10], 100.0f);
-    EXPECT_EQ(a[11], 66.66667f);
-    EXPECT_EQ(a[12], 0.0f);  // level 0: neither counted nor above the threshold 0
-    EXPECT_EQ(a[13], 50.0f);
+    // Level 0 (bin 12) is neither counted nor above the threshold 0.
+    GuardedOut a = readOut(false, 4);
+    for (size_t k = 0; k < bins.size(); ++k) EXPECT_EQ(a[10 + static_cast<int>(k)], bins[k].second) << k;
     EXPECT_FLOAT_EQ(a[14], 116.66667f);
-    EXPECT_EQ(a[0], kSentinel);
-    // Level unit: 1.2 dB of magnitude, 0 at 1e-6.
     for (double m : {3e-5, 0.2, 0.77}) {
         setBin(20, m);
-        canvas->getSpectrumData(a.out());
-        EXPECT_NEAR(a[20], (20.0 * std::log10(m) + 120.0) / 1.2, 1e-4);
+        a = readOut(false, 5);
+        EXPECT_NEAR(a[20], levelOf(m), 1e-4);
     }
-    EXPECT_TRUE(a.guardsIntact());
 }
 
 TEST_F(SpectrumReadoutTest, ThresholdsAndCounting) {
-    const double minusFive = std::pow(10.0, -6.3);
     setBin(5, 1.0);                   // 100
     setBin(6, 1e-3);                  // exactly 50
     setBin(7, 0.01);                  // 66.66667
-    setBin(8, minusFive);             // about -5
+    setBin(8, std::pow(10.0, -6.3));  // about -5
     setBin(9, std::pow(10.0, -4.5));  // 25
     setBin(10, std::nan(""));
     setBin(11, HUGE_VAL);  // +infinity is not finite either
-
     for (int level : {0, 50, -10}) {
         SCOPED_TRACE("threshold " + std::to_string(level));
-        testing::internal::CaptureStdout();
-        if (level != 0) canvas->setDetectionLevel(level);
-        testing::internal::GetCapturedStdout();
-        GuardedOut a;
-        // Bins 5, 6, 7 and 9, whatever the threshold.
-        EXPECT_EQ(canvas->getSpectrumData(a.out()), 4);
+        if (level != 0) setLevel(level);
+        const GuardedOut a = readOut(false, 4);  // bins 5, 6, 7 and 9, whatever the threshold
         EXPECT_EQ(a[5], 100.0f);
         EXPECT_EQ(a[6], level < 50 ? 50.0f : 0.0f);
         EXPECT_EQ(a[7], 66.66667f);
@@ -112,78 +95,58 @@ TEST_F(SpectrumReadoutTest, ThresholdsAndCounting) {
             EXPECT_EQ(a[8], 0.0f);
         }
         EXPECT_EQ(a[9], level < 25 ? 25.0f : 0.0f);
-        EXPECT_EQ(a[10], 0.0f);
-        EXPECT_EQ(a[11], 0.0f);
-        for (int i = 12; i < 256; ++i) ASSERT_EQ(a[i], 0.0f) << i;
-        for (int i = 1; i < 5; ++i) ASSERT_EQ(a[i], 0.0f) << i;
-        EXPECT_EQ(a[0], kSentinel);
-        EXPECT_TRUE(a.guardsIntact());
+        for (int i = 1; i < 256; ++i) ASSERT_EQ(i >= 5 && i <= 9 ? 0.0f : a[i], 0.0f) << i;
     }
 }
 
 TEST_F(SpectrumReadoutTest, MaskedLayout) {
+    // Entries that can carry a level: 26, 27, then every decade's x0 and x3..x7 up to 200.
+    std::set<int> mask = {26, 27};
+    for (int d = 3; d <= 20; ++d)
+        for (int u : {0, 3, 4, 5, 6, 7})
+            if (d < 20 || u == 0) mask.insert(10 * d + u);
+    ASSERT_EQ(mask.size(), 2u + 18u + 17u * 5u);
     for (int i = 0; i < 256; ++i) setBin(i, 1.0);
-    GuardedOut z;
-    EXPECT_EQ(canvas->getSpectrumData_zorv(z.out()), 255);
-    const std::set<int> mask = maskedEntries();
-    EXPECT_EQ(mask.size(), 2u + 18u + 17u * 5u);
+    GuardedOut z = readOut(true, 255);
     for (int k = 2; k < 256; ++k) EXPECT_EQ(z[k], mask.count(k) ? 100.0f : 0.0f) << k;
-    EXPECT_EQ(z[0], kSentinel);
-    EXPECT_EQ(z[1], kSentinel);
-    EXPECT_TRUE(z.guardsIntact());
 
     // Entry k carries bin k - 1: a tone in bin 30 gives nothing at 31 (x1 is masked).
     for (int i = 0; i < 256; ++i) setBin(i, 0.0);
     setBin(30, 1.0);
     setBin(29, 0.5);
-    GuardedOut t;
-    EXPECT_EQ(canvas->getSpectrumData_zorv(t.out()), 2);
-    EXPECT_EQ(t[31], 0.0f);
-    EXPECT_FLOAT_EQ(t[30], static_cast<float>((20.0 * std::log10(0.5) + 120.0) / 1.2));
-    for (int k = 2; k < 256; ++k) {
-        if (k != 30) {
-            ASSERT_EQ(t[k], 0.0f) << k;
-        }
-    }
+    z = readOut(true, 2);
+    EXPECT_FLOAT_EQ(z[30], static_cast<float>(levelOf(0.5)));
+    for (int k = 2; k < 256; ++k) ASSERT_EQ(k == 30 ? 0.0f : z[k], 0.0f) << k;
 
     // Level 80 at bin 25: entry 26 of the masked layout, entry 25 of the plain one.
     setBin(30, 0.0);
     setBin(29, 0.0);
     setBin(25, std::pow(10.0, -1.2));
-    GuardedOut plain, masked;
-    canvas->getSpectrumData(plain.out());
-    canvas->getSpectrumData_zorv(masked.out());
+    const GuardedOut plain = readOut(false, 1);
+    z = readOut(true, 1);
     EXPECT_NEAR(plain[25], 80.0f, 1e-4);
-    EXPECT_EQ(masked[26], plain[25]);
-    EXPECT_EQ(masked[25], 0.0f);
+    EXPECT_EQ(z[26], plain[25]);
+    EXPECT_EQ(z[25], 0.0f);
 
     // Bin 255 is counted but has no entry.
     setBin(25, 0.0);
     setBin(255, 1.0);
-    GuardedOut last;
-    EXPECT_EQ(canvas->getSpectrumData_zorv(last.out()), 1);
-    for (int k = 2; k < 256; ++k) ASSERT_EQ(last[k], 0.0f) << k;
-    EXPECT_TRUE(last.guardsIntact());
+    z = readOut(true, 1);
+    for (int k = 2; k < 256; ++k) ASSERT_EQ(z[k], 0.0f) << k;
 }
 
 TEST_F(SpectrumReadoutTest, MaskedLayoutThresholds) {
     setBin(29, 1e-3);                  // entry 30, level 50
     setBin(32, 0.01);                  // entry 33, level 66.67
     setBin(33, std::pow(10.0, -6.3));  // entry 34, level about -5
-    testing::internal::CaptureStdout();
-    canvas->setDetectionLevel(50);
-    testing::internal::GetCapturedStdout();
-    GuardedOut a;
-    EXPECT_EQ(canvas->getSpectrumData_zorv(a.out()), 2);
+    setLevel(50);
+    GuardedOut a = readOut(true, 2);
     EXPECT_EQ(a[30], 0.0f);
     EXPECT_EQ(a[33], 66.66667f);
     EXPECT_EQ(a[34], 0.0f);
-    testing::internal::CaptureStdout();
-    canvas->setDetectionLevel(-10);
-    testing::internal::GetCapturedStdout();
-    GuardedOut b;
-    EXPECT_EQ(canvas->getSpectrumData_zorv(b.out()), 2);
-    EXPECT_EQ(b[30], 50.0f);
-    EXPECT_NEAR(b[34], -5.0f, 1e-4);
-    EXPECT_EQ(b[35], 0.0f);  // magnitude 0: -infinity is never written
+    setLevel(-10);
+    a = readOut(true, 2);
+    EXPECT_EQ(a[30], 50.0f);
+    EXPECT_NEAR(a[34], -5.0f, 1e-4);
+    EXPECT_EQ(a[35], 0.0f);  // magnitude 0: -infinity is never written
 }
