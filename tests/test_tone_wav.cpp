@@ -5,31 +5,18 @@
 
 #include <algorithm>
 #include <cmath>
-#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
-#include <string>
-#include <vector>
-
-#include <gtest/gtest.h>
-
-#include <korvo/platform/TestControl.h>
 
 #include "support/ToneTestSupport.h"
-#include "tone/MiniToneGenerator.h"
 
 namespace {
 
-namespace test = korvo::platform::test;
-using android::MiniToneGenerator;
-using korvo::tonetest::RefWave;
-using korvo::tonetest::stateOf;
-using korvo::tonetest::waitUntil;
-using Gen = MiniToneGenerator::WaveGenerator;
+using namespace korvo::tonetest;
 
 constexpr double kPi = 3.14159265358979323846;
 
-double dftMagnitude(const std::vector<int16_t>& s, size_t begin, size_t end, double hz, double rate) {
+double dftMagnitude(const Samples& s, size_t begin, size_t end, double hz, double rate) {
     double re = 0, im = 0;
     for (size_t n = begin; n < end; ++n) {
         double ph = 2 * kPi * hz * static_cast<double>(n) / rate;
@@ -39,7 +26,7 @@ double dftMagnitude(const std::vector<int16_t>& s, size_t begin, size_t end, dou
     return std::hypot(re, im) / static_cast<double>(end - begin);
 }
 
-int peakAbs(const std::vector<int16_t>& s, size_t begin, size_t end) {
+int peakAbs(const Samples& s, size_t begin, size_t end) {
     int peak = 0;
     for (size_t n = begin; n < end; ++n) peak = std::max(peak, std::abs(static_cast<int>(s[n])));
     return peak;
@@ -49,52 +36,37 @@ class ToneWavTest : public ::testing::Test {
 protected:
     void SetUp() override {
         test::resetAll();
-        mPath = "/tmp/korvo_tone_wav_" + std::to_string(getpid()) + ".wav";
-        const char* old = getenv("KORVO_SPEAKER");
-        mHadSpeaker = old != nullptr;
-        if (old) mOldSpeaker = old;
+        if (const char* old = getenv("KORVO_SPEAKER")) mOldSpeaker = old;
         setenv("KORVO_SPEAKER", ("wav:" + mPath).c_str(), 1);
     }
     void TearDown() override {
-        if (mHadSpeaker) {
-            setenv("KORVO_SPEAKER", mOldSpeaker.c_str(), 1);
-        } else {
-            unsetenv("KORVO_SPEAKER");
-        }
+        if (mOldSpeaker.empty()) unsetenv("KORVO_SPEAKER");
+        else setenv("KORVO_SPEAKER", mOldSpeaker.c_str(), 1);
         std::remove(mPath.c_str());
         test::resetAll();
     }
 
-    std::vector<int16_t> readWav(SF_INFO* info) {
-        SNDFILE* f = sf_open(mPath.c_str(), SFM_READ, info);
-        EXPECT_NE(f, nullptr) << sf_strerror(nullptr);
-        if (!f) return {};
-        std::vector<int16_t> s(static_cast<size_t>(info->frames) * static_cast<size_t>(info->channels));
-        sf_count_t got = sf_readf_short(f, s.data(), info->frames);
-        sf_close(f);
-        s.resize(static_cast<size_t>(got));
-        return s;
-    }
-
-    std::string mPath;
-    std::string mOldSpeaker;
-    bool mHadSpeaker = false;
+    std::string mPath = "/tmp/korvo_tone_wav_" + std::to_string(getpid()) + ".wav";
+    std::string mOldSpeaker;  // empty: none was set
 };
 
 TEST_F(ToneWavTest, LimitedToneInTheFile) {
     {
-        MiniToneGenerator gen(AUDIO_STREAM_MUSIC, 0.8f, false);
-        ASSERT_EQ(stateOf(gen), MiniToneGenerator::TONE_INIT);
+        Engine gen(AUDIO_STREAM_MUSIC, 0.8f, false);
         ASSERT_TRUE(gen.startTone(1, 200));  // code 1: 3440 Hz
-        ASSERT_TRUE(waitUntil([&] { return stateOf(gen) == MiniToneGenerator::TONE_INIT; }, 5000));
+        ASSERT_TRUE(waitUntil([&] { return stateOf(gen) == Engine::TONE_INIT; }, 5000));
         ASSERT_TRUE(test::waitTrackStopped(5000));
     }  // destroying the engine drops the track and closes the file
 
     SF_INFO info{};
-    std::vector<int16_t> s = readWav(&info);
+    SNDFILE* f = sf_open(mPath.c_str(), SFM_READ, &info);
+    ASSERT_NE(f, nullptr) << sf_strerror(nullptr);
     EXPECT_EQ(info.samplerate, 44100);
-    EXPECT_EQ(info.channels, 1);
+    ASSERT_EQ(info.channels, 1);  // the buffer below holds one channel
     EXPECT_EQ(info.format & SF_FORMAT_SUBMASK, SF_FORMAT_PCM_16);
+    Samples s(static_cast<size_t>(info.frames));
+    s.resize(static_cast<size_t>(sf_readf_short(f, s.data(), info.frames)));
+    sf_close(f);
 
     // 200 ms = 8820 samples; the tone lasts until the first block whose running
     // total exceeds it: 11 blocks of 882, the last one the fade-out.
@@ -124,13 +96,9 @@ TEST_F(ToneWavTest, LimitedToneInTheFile) {
 
     // Sample for sample: a start block, nine continued blocks, one fade-out block.
     RefWave ref(44100, 3440, 0.45f);
-    std::vector<int16_t> want = ref.block(882, Gen::WAVEGEN_START);
-    for (int b = 0; b < 9; ++b) {
-        std::vector<int16_t> part = ref.block(882, Gen::WAVEGEN_CONT);
-        want.insert(want.end(), part.begin(), part.end());
-    }
-    std::vector<int16_t> fade = ref.block(882, Gen::WAVEGEN_STOP);
-    want.insert(want.end(), fade.begin(), fade.end());
+    Samples want = ref.block(882, START);
+    for (int b = 0; b < 9; ++b) append(want, ref.block(882, CONT));
+    append(want, ref.block(882, STOP));
     EXPECT_TRUE(std::equal(want.begin(), want.end(), s.begin()));
 }
 

@@ -1,13 +1,16 @@
-// Helpers shared by the tone engine, playback callback and output track tests.
+// Helpers shared by the tone engine, playback callback and wave generator tests.
 #pragma once
 #include <pthread.h>
 
+#include <algorithm>
 #include <chrono>
-#include <cstdint>
 #include <functional>
+#include <future>
 #include <initializer_list>
 #include <string>
 #include <vector>
+
+#include <gtest/gtest.h>
 
 #include <korvo/platform/TestControl.h>
 
@@ -16,27 +19,34 @@
 namespace korvo {
 namespace tonetest {
 
-using android::MiniToneGenerator;
+namespace test = korvo::platform::test;
+using Engine = android::MiniToneGenerator;
+using Gen = Engine::WaveGenerator;
+using Seg = Engine::ToneSegment;
+using Lines = std::vector<std::string>;
+using Samples = std::vector<int16_t>;
+constexpr unsigned START = Gen::WAVEGEN_START, CONT = Gen::WAVEGEN_CONT, STOP = Gen::WAVEGEN_STOP;
+// A copy: the class constant has no out-of-line definition to bind references to.
+constexpr unsigned kInf = Engine::TONEGEN_INF;
 
 // Polls pred until it holds or the time is up.
 bool waitUntil(const std::function<bool()>& pred, int timeoutMs = 5000);
 
-// Messages of the kept log under one tag, in order.
-std::vector<std::string> messagesOf(const std::string& tag);
-std::vector<std::string> toneMessages();
-// Number of kept lines of the tag with exactly this message.
-int countMessage(const std::string& tag, const std::string& msg);
-// Whether the kept log has the message under the tag at the priority.
-bool hasLine(const std::string& tag, int prio, const std::string& msg);
-// Waits until the engine has logged `msg` at least `count` times.
-bool waitForToneMessage(const std::string& msg, int count = 1, int timeoutMs = 5000);
-// Whether `wanted` occurs in `lines` as a subsequence; a wanted entry ending in '*'
-// matches any message that starts with the rest.
-bool inOrder(const std::vector<std::string>& lines, const std::vector<std::string>& wanted);
+// The engine's kept log. A wanted line ending in '*' matches any line that starts with the rest.
+Lines toneMessages();
+int toneCount(const std::string& msg);
+bool hasToneLine(int prio, const std::string& wanted);
+::testing::AssertionResult lastToneLine(int prio, const std::string& wanted);
+// `wanted` occurs in `lines` as a subsequence / is the whole of `lines`.
+::testing::AssertionResult inOrder(const Lines& lines, const Lines& wanted);
+::testing::AssertionResult linesAre(const Lines& lines, const Lines& wanted);
+inline bool waitForToneMessage(const std::string& msg, int count = 1) {
+    return waitUntil([&] { return toneCount(msg) >= count; });
+}
 
 // Runs f with the engine's lock held (fields the other thread writes under it).
 template <class F>
-auto underLock(MiniToneGenerator& gen, F f) -> decltype(f()) {
+auto underLock(Engine& gen, F f) -> decltype(f()) {
     pthread_mutex_lock(&gen.mLock);
     struct Unlock {
         pthread_mutex_t* m;
@@ -44,36 +54,81 @@ auto underLock(MiniToneGenerator& gen, F f) -> decltype(f()) {
     } unlock{&gen.mLock};
     return f();
 }
+template <class T>
+T locked(Engine& gen, T Engine::*field) {
+    return underLock(gen, [&] { return gen.*field; });
+}
+inline size_t genCount(Engine& gen) {
+    return underLock(gen, [&] { return gen.mWaveGens.size(); });
+}
+inline uint16_t stateOf(const Engine& gen) { return gen.mState.load(std::memory_order_relaxed); }
 
-inline uint16_t stateOf(const MiniToneGenerator& gen) {
-    return gen.mState.load(std::memory_order_relaxed);
+template <class F>
+auto async(F f) {
+    return std::async(std::launch::async, f);
+}
+template <class T>
+bool ready(std::future<T>& f, int seconds = 5) {
+    return f.wait_for(std::chrono::seconds(seconds)) == std::future_status::ready;
 }
 
-// A hand-built record of the tone table, put back to zero when the scope ends.
+// Log captured, callbacks pumped by hand.
+class ToneTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        test::resetAll();
+        test::captureLog(true);
+        test::manualTrackCallbacks(true);
+    }
+    void TearDown() override { test::resetAll(); }
+};
+
+// startTone on another thread, its first buffer pumped once it waits for it.
+bool startAndPump(Engine& gen, int code, int ms, test::PumpResult* first = nullptr, size_t samples = 0);
+// stopTone on another thread, returned once it waits for the callback.
+std::future<void> stopAsync(Engine& gen);
+// Pumps until the tone has ended and the track is stopped.
+void drain(Engine& gen, int maxPumps = 200);
+// Pumps one buffer and checks the state after it; with `want`, also the buffer's samples
+// and size and exactly the messages logged meanwhile.
+::testing::AssertionResult pumped(Engine& gen, uint16_t state);
+::testing::AssertionResult pumped(Engine& gen, uint16_t state, const Samples& want, const Lines& log,
+                                  size_t bytes = 1764);
+
+// A hand-built record of the tone table, put back when the scope ends.
 class ScopedDescriptor {
 public:
-    ScopedDescriptor(int code, std::initializer_list<MiniToneGenerator::ToneSegment> segments);
-    ~ScopedDescriptor();
+    ScopedDescriptor(int code, std::initializer_list<Seg> segments)
+        : mCode(code), mSaved(Engine::sToneDescriptors[code]) {
+        Engine::ToneDescriptor& d = Engine::sToneDescriptors[code] = Engine::ToneDescriptor{};
+        std::copy(segments.begin(), segments.end(), d.segments);
+        d.code = static_cast<unsigned>(code);
+    }
+    ~ScopedDescriptor() { Engine::sToneDescriptors[mCode] = mSaved; }
     ScopedDescriptor(const ScopedDescriptor&) = delete;
-    ScopedDescriptor& operator=(const ScopedDescriptor&) = delete;
 
 private:
     int mCode;
-    MiniToneGenerator::ToneDescriptor mSaved;
+    Engine::ToneDescriptor mSaved;
 };
 
-// Reference output of one fresh sine generator driven block by block.
-class RefWave {
-public:
-    RefWave(unsigned rate, unsigned freq, float gain);
+// A fresh sine generator driven block by block: the reference output.
+struct RefWave {
+    RefWave(unsigned rate, unsigned freq, float gain)
+        : gen(static_cast<unsigned short>(rate), static_cast<unsigned short>(freq), gain) {}
     // The next `count` samples produced with the command, from silence.
-    std::vector<int16_t> block(unsigned count, unsigned command);
-    // The same, added into out (its whole length).
-    void addInto(std::vector<int16_t>& out, unsigned command);
-
-private:
-    MiniToneGenerator::WaveGenerator mGen;
+    Samples block(unsigned count, unsigned command) {
+        Samples out(count, 0);
+        addInto(out, command);
+        return out;
+    }
+    void addInto(Samples& out, unsigned command) {
+        gen.getSamples(out.data(), static_cast<unsigned>(out.size()), command);
+    }
+    Gen gen;
 };
+
+inline void append(Samples& to, const Samples& more) { to.insert(to.end(), more.begin(), more.end()); }
 
 }  // namespace tonetest
 }  // namespace korvo
