@@ -226,9 +226,10 @@ size_t runTrackCallback(TrackCore& core, std::vector<int16_t>& buffer, size_t sa
     if (produced != 0) {
         core.route->write(buffer.data(), produced);
     } else {
-        // Nothing produced: the timeline goes on with silence.
-        std::vector<int16_t> silence(samples, 0);
-        core.route->write(silence.data(), samples);
+        // Nothing produced: the timeline goes on with silence, written from the same buffer
+        // so that the playback thread allocates nothing per callback.
+        std::fill(buffer.begin(), buffer.end(), 0);
+        core.route->write(buffer.data(), samples);
     }
     return b.size;
 }
