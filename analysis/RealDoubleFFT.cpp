@@ -1,8 +1,8 @@
 #include "analysis/RealDoubleFFT.h"
 
-#include <log/log.h>
-
 #include <cmath>
+
+#include "interface/LogTags.h"
 
 // Mixed-radix real forward transform; every table read goes through the guarded read of
 // its table. The radix-3, radix-5 and general passes keep the classic column-major index
@@ -476,9 +476,7 @@ RealDoubleFFT::~RealDoubleFFT() { wavetable.clear(); }
 void RealDoubleFFT::forwardTransform(android::sp<WaveTable_Double> data) {
     if (data == nullptr) return;
     if (data->length != n) {
-        __android_log_print(ANDROID_LOG_DEBUG, "TQX",
-                            "[%s) The length of data can not match that of the wavetable",
-                            "SoundMeter");
+        METER_LOGD("[%s) The length of data can not match that of the wavetable");
     }
     // A table shorter than n cannot hold the transform: it is refused and left as it is.
     if (n < 1 || data->length < n) return;

@@ -1,19 +1,20 @@
-#include <log/log.h>
 
 #include <cmath>
 #include <cstdio>
 
 #include "analysis/RealDoubleFFT.h"
 #include "analysis/WaveformCanvas.h"
+#include "interface/LogTags.h"
+#include "interface/SoundMeterConstants.h"
 
 namespace android {
 
 namespace {
 
-constexpr int kFrameLength = 512;
-constexpr int kBins = 256;
-constexpr double kInputScale = 3.0517578125e-05;  // 2^-15: a 16-bit sample as a fraction
-constexpr float kMagnitudeDivisor = 325.6832f;
+constexpr int kFrameLength = korvo::kFrameSamples;
+constexpr int kBins = korvo::kSpectrumBins;
+constexpr double kInputScale = korvo::kInputScale;
+constexpr float kMagnitudeDivisor = korvo::kMagnitudeDivisor;
 
 // |X_i| of the transformed table r (r[2i - 1] and r[2i] hold bin i), scaled in single precision.
 float binMagnitude(const WaveTable_Reader& r, int i) {
@@ -42,9 +43,7 @@ void WaveformCanvas::drawSpectrum(short* samples, int count) {
 
 void WaveformCanvas::SpectrumAnalyser_setInput(short* input, int offset, int count, double* out) {
     if (count != kFrameLength) {
-        __android_log_print(ANDROID_LOG_ERROR, "TQX",
-                            "[%s] SpectrumAnalyser_setInput: bad input count(%d) in FFT",
-                            "WAVEFORM_CANVAS", count);
+        CANVAS_LOG(ANDROID_LOG_ERROR, "[%s] SpectrumAnalyser_setInput: bad input count(%d) in FFT", count);
         return;
     }
     for (int i = 0; i < kFrameLength; ++i) out[i] = input[offset + i] * kInputScale;
@@ -59,9 +58,7 @@ void WaveformCanvas::SpectrumAnalyser_Transform(sp<WaveTable_Double> data) {
 void WaveformCanvas::spectrumAnalyser_getResults_Last(sp<WaveTable_Double> fft,
                                                       sp<WaveTable_Double> out) {
     if (out->length != kBins) {
-        __android_log_print(ANDROID_LOG_ERROR, "TQX",
-                            "[%s] bad output buffer size in FFT: must be %d; given %d",
-                            "WAVEFORM_CANVAS", kBins, out->length);
+        CANVAS_LOG(ANDROID_LOG_ERROR, "[%s] bad output buffer size in FFT: must be %d; given %d", kBins, out->length);
     }
     // A shorter table gets the bins that fit: nothing is written past its end.
     const int bins = out->length < kBins ? out->length : kBins;
@@ -73,17 +70,13 @@ void WaveformCanvas::spectrumAnalyser_getResults_Last(sp<WaveTable_Double> fft,
 int WaveformCanvas::spectrumAnalyser_getResults(sp<WaveTable_Double> fft,
                                                 sp<WaveTable_Double> average,
                                                 sp<WaveTable_Double_2> hist, int index) {
-    std::printf("[%s] spectrumAnalyser_getResults\n", "WAVEFORM_CANVAS");
+    std::printf("[%s] spectrumAnalyser_getResults\n", korvo::kCanvasWho);
     if (average->length != kBins) {
-        __android_log_print(ANDROID_LOG_ERROR, "TQX",
-                            "[%s] bad average buffer size in FFT: must be %d ; given %d",
-                            "WAVEFORM_CANVAS", kBins, average->length);
+        CANVAS_LOG(ANDROID_LOG_ERROR, "[%s] bad average buffer size in FFT: must be %d ; given %d", kBins, average->length);
         return -1;
     }
     if (hist->length != kBins) {
-        __android_log_print(ANDROID_LOG_ERROR, "TQX",
-                            "[%s] bad history buffer size in FFT: must be %d ; given %d",
-                            "WAVEFORM_CANVAS", kBins, hist->length);
+        CANVAS_LOG(ANDROID_LOG_ERROR, "[%s] bad history buffer size in FFT: must be %d ; given %d", kBins, hist->length);
         return -1;
     }
     const int w = hist->width;

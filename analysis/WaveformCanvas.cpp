@@ -1,18 +1,19 @@
 #include "analysis/WaveformCanvas.h"
 
-#include <log/log.h>
 #include <unistd.h>
 
 #include <cstdio>
 
 #include "capture/FrameExchange.h"
+#include "interface/LogTags.h"
+#include "interface/SoundMeterConstants.h"
 
 namespace android {
 
 namespace {
-constexpr int kBins = 256;
-constexpr int kFrameLength = 512;
-constexpr int kRingSlots = 5;
+constexpr int kBins = korvo::kSpectrumBins;
+constexpr int kFrameLength = korvo::kFrameSamples;
+constexpr int kRingSlots = korvo::kRingSlots;
 constexpr useconds_t kTurnPauseUs = 20000;
 }  // namespace
 
@@ -65,15 +66,14 @@ void WaveformCanvas::setActive(bool on) { active.store(on, std::memory_order_rel
 
 void WaveformCanvas::setDetectionLevel(int value) {
     detectionLevel.store(value, std::memory_order_relaxed);
-    std::printf("[%s] detection Level is %d\n", "WAVEFORM_CANVAS", value);
-    __android_log_print(ANDROID_LOG_ERROR, "TQX", "[%s] detection Level is %d\n", "WAVEFORM_CANVAS",
-                        value);
+    std::printf("[%s] detection Level is %d\n", korvo::kCanvasWho, value);
+    CANVAS_LOG(ANDROID_LOG_ERROR, "[%s] detection Level is %d\n", value);
 }
 
 int WaveformCanvas::getDetectionLevel() { return detectionLevel.load(std::memory_order_relaxed); }
 
 void WaveformCanvas::release() {
-    __android_log_print(ANDROID_LOG_DEBUG, "TQX", "[%s] WaveformCanvas Relese", "WAVEFORM_CANVAS");
+    CANVAS_LOG(ANDROID_LOG_DEBUG, "[%s] WaveformCanvas Relese");
 }
 
 }  // namespace android

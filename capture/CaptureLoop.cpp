@@ -5,18 +5,12 @@
 
 #include <cstring>
 
-#include <log/log.h>
 #include <utils/Timers.h>
 
 #include "capture/CaptureLoop.h"
 #include "capture/FrameExchange.h"
+#include "interface/LogTags.h"
 #include "meter/SoundMeter.h"
-
-namespace {
-const char* const kTag = "TQX";
-const char* const kWho = "SoundMeter";
-const int kRingSlots = 5;
-}  // namespace
 
 namespace korvo {
 
@@ -65,7 +59,7 @@ void SoundMeter::processAudio() {
 
     int32_t n = static_cast<int32_t>(r / 2);
     if (r <= -2) {
-        __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] Audio read failed rror = %d", kWho, n);
+        METER_LOGD("[%s] Audio read failed rror = %d", n);
     }
     // A failed read stored nothing: count it as no samples, so the slot position stays in the ring.
     if (n < 0) n = 0;
@@ -73,15 +67,14 @@ void SoundMeter::processAudio() {
     const bool complete = fillAtRead + n >= frameSamples;
     if (!complete) {
         // The rest of the frame is read into the same slot, from this offset on.
-        __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] ================== end %d\n", kWho,
-                            fillAtRead + n);
+        METER_LOGD("[%s] ================== end %d\n", fillAtRead + n);
         frameFill.store(fillAtRead + n, std::memory_order_relaxed);
     } else {
         frameFill.store(0, std::memory_order_relaxed);
         const float level = static_cast<float>(korvo::levelOf(target, n));
         int16_t copy[sizeof(pcmRing) / sizeof(pcmRing[0])];
         memcpy(copy, pcmRing, sizeof(copy));
-        korvo::publishFrame(slot % kRingSlots, level, copy, n);
+        korvo::publishFrame(slot % korvo::kRingSlots, level, copy, n);
 
         const int64_t w = korvo::captureWaitNs(sleep, systemTime(SYSTEM_TIME_MONOTONIC) - t0);
         struct timespec now;
@@ -93,6 +86,6 @@ void SoundMeter::processAudio() {
     pthread_mutex_unlock(&AudioBufferLock);
 
     if (complete) {
-        ringIndex.store((slot + 1) % kRingSlots, std::memory_order_relaxed);
+        ringIndex.store((slot + 1) % korvo::kRingSlots, std::memory_order_relaxed);
     }
 }

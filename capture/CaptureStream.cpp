@@ -4,17 +4,12 @@
 
 #include <unistd.h>
 
-#include <log/log.h>
 #include <media/AudioRecord.h>
 
+#include "interface/LogTags.h"
 #include "meter/SoundMeter.h"
 
 using android::AudioRecord;
-
-namespace {
-const char* const kTag = "TQX";
-const char* const kWho = "SoundMeter";
-}  // namespace
 
 int AudioRecord_getMinBufferSize(int sampleRate, int channelConfig, int audioFormat) {
     int channelCount;
@@ -23,17 +18,14 @@ int AudioRecord_getMinBufferSize(int sampleRate, int channelConfig, int audioFor
         case 3: case 12: case 48: channelCount = 2; break;
         case 0x3F0000: channelCount = 6; break;
         default:
-            __android_log_print(ANDROID_LOG_DEBUG, kTag,
-                                "[%s] getMinBufferSize(): Invalid channel configuration.\n", kWho);
+            METER_LOGD("[%s] getMinBufferSize(): Invalid channel configuration.\n");
             return -1;
     }
     if (audioFormat != 2 && (audioFormat < 100 || audioFormat > 105)) {
-        __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] getMinBufferSize(): Invalid audio format.",
-                            kWho);
+        METER_LOGD("[%s] getMinBufferSize(): Invalid audio format.");
         return -1;
     }
-    __android_log_print(ANDROID_LOG_VERBOSE, kTag, "[%s] android_media_AudioRecord_get_min_buff_size(%d, %d, %d)",
-                        kWho, sampleRate, channelCount, audioFormat);
+    METER_LOG(ANDROID_LOG_VERBOSE, "[%s] android_media_AudioRecord_get_min_buff_size(%d, %d, %d)", sampleRate, channelCount, audioFormat);
 
     audio_format_t format;
     switch (audioFormat) {
@@ -56,8 +48,7 @@ int AudioRecord_getMinBufferSize(int sampleRate, int channelConfig, int audioFor
         return -1;
     }
     int bytesPerSample = audioFormat == 2 ? 2 : (audioFormat == 101 ? 61 : 1);
-    __android_log_print(ANDROID_LOG_VERBOSE, kTag, "[%s] FrameCount[%d] x nbChannels[%d] x bytesPerSample[%d]",
-                        kWho, static_cast<int>(frameCount), channelCount, bytesPerSample);
+    METER_LOG(ANDROID_LOG_VERBOSE, "[%s] FrameCount[%d] x nbChannels[%d] x bytesPerSample[%d]", static_cast<int>(frameCount), channelCount, bytesPerSample);
     uint32_t size = static_cast<uint32_t>(channelCount) * static_cast<uint32_t>(bytesPerSample) *
                     static_cast<uint32_t>(frameCount);
     if (size == 0 || size == 0xFFFFFFFFu) return -1;
@@ -65,7 +56,7 @@ int AudioRecord_getMinBufferSize(int sampleRate, int channelConfig, int audioFor
 }
 
 void recorderCallback(int event, void* /*user*/, void* /*info*/) {
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[SoundMeter] recorderCallback event[%d]\n", event);
+    __android_log_print(ANDROID_LOG_DEBUG, korvo::kMeterTag, "[SoundMeter] recorderCallback event[%d]\n", event);
 }
 
 void SoundMeter::startRecord() {
@@ -78,24 +69,25 @@ void SoundMeter::startRecord() {
                      nullptr);
     prepareCountdown = 200;
     while (prepareCountdown != 0) {
-        __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] AudioRecord preparation %d\n", kWho,
-                            prepareCountdown);
+        METER_LOGD("[%s] AudioRecord preparation %d\n", prepareCountdown);
         usleep(50000);
         prepareCountdown -= 50;
     }
     audioRecord->start(android::AudioSystem::SYNC_EVENT_NONE, AUDIO_SESSION_NONE);
     recordState.store(1, std::memory_order_relaxed);
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] AudioRecord Started\n", kWho);
+    METER_LOGD("[%s] AudioRecord Started\n");
 }
 
 void SoundMeter::stopRecord() {
     // Without a stream (no startRecord yet) there is nothing to stop: nothing happens.
     if (audioRecord == nullptr) return;
-    audioRecord->stop();
+    // The state goes before the stream: a read that the stop releases then finds the
+    // recording stopped at its post-read check and gives the step up, nothing changed.
+    recordState.store(0, std::memory_order_relaxed);
     ringIndex.store(0, std::memory_order_relaxed);
     frameFill.store(0, std::memory_order_relaxed);
-    recordState.store(0, std::memory_order_relaxed);
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] AudioRecord Stopped\n", kWho);
+    audioRecord->stop();
+    METER_LOGD("[%s] AudioRecord Stopped\n");
 }
 
 void SoundMeter::stopAudio() {

@@ -4,9 +4,8 @@
 #include <cmath>
 #include <cstring>
 
-#include <log/log.h>
-
 #include "analysis/WaveformCanvas.h"
+#include "interface/LogTags.h"
 
 namespace {
 
@@ -46,7 +45,7 @@ bool sEventInitialised = false;  // guarded by EventRW
 // Called with DataRW held.
 void initialiseMdataOnce() {
     if (sMdataInitialised) return;
-    __android_log_print(ANDROID_LOG_DEBUG, "TQX", "[%s] Initialize MDATA\n", "SoundMeter");
+    METER_LOGD("[%s] Initialize MDATA\n");
     sMdataInitialised = true;
     MDATA.index = 0;
     MDATA.level = 0;

@@ -9,11 +9,12 @@
 #include <utils/StrongPointer.h>
 
 #include "interface/Export.h"
+#include "interface/SoundMeterConstants.h"
 
 struct Mmic_data_t {
     int32_t index;       // ring slot (0..4) of the newest complete frame
     float level;         // level in dB of the read that completed it
-    int16_t data[2560];  // the whole five-frame ring
+    int16_t data[korvo::kRingSamples];  // the whole five-frame ring
     int32_t count;       // samples delivered by the completing read
     int32_t reserved;    // copied both ways, never set by the library
 };

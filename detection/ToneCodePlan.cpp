@@ -1,18 +1,18 @@
-// The tone code plan: the table shared by the sending and the listening side,
-// the two plan generators and the look-ups from frequency indices to codes.
-#include <cstdint>
+#include "detection/ToneCodePlan.h"
 
-#include <log/log.h>
+#include "interface/LogTags.h"
+#include "interface/SoundMeterConstants.h"
 
-#include "tone/MiniToneGenerator.h"
+namespace korvo {
+namespace plan {
 
-namespace android {
+using android::ToneDescriptor;
+using android::ToneSegment;
 
 namespace {
 
-const char* const kTag = "MiniToneGenerator";
-const float kSampleIntervalHz = 86.0f;  // the plan's step per frequency index
-const int kSampleRate = 44100;
+const char* const kTag = kToneTag;
+const float kSampleIntervalHz = static_cast<float>(kIndexHz);  // the plan's step per frequency index
 
 // Hz of frequency index k, as both ends of the link compute it.
 int indexToHz(int k) { return static_cast<int>(static_cast<float>(k) * kSampleIntervalHz); }
@@ -29,9 +29,9 @@ void storeIfDifferent(T& field, V value) {
     if (field != static_cast<T>(value)) field = static_cast<T>(value);
 }
 
-void writeFirstSegment(MiniToneGenerator::ToneDescriptor& rec, int f1, int f2) {
-    MiniToneGenerator::ToneSegment& seg = rec.segments[0];
-    storeIfDifferent(seg.duration, MiniToneGenerator::TONEGEN_INF);
+void writeFirstSegment(ToneDescriptor& rec, int f1, int f2) {
+    ToneSegment& seg = rec.segments[0];
+    storeIfDifferent(seg.duration, kToneForever);
     storeIfDifferent(seg.waveFreq[0], f1);
     storeIfDifferent(seg.waveFreq[1], f2);
     storeIfDifferent(seg.waveFreq[2], 0);
@@ -39,35 +39,33 @@ void writeFirstSegment(MiniToneGenerator::ToneDescriptor& rec, int f1, int f2) {
     storeIfDifferent(seg.loopIndex, 0);
 }
 
-void writeCodes(MiniToneGenerator::ToneDescriptor& rec, unsigned int code, int freqCode) {
+void writeCodes(ToneDescriptor& rec, unsigned int code, int freqCode) {
     storeIfDifferent(rec.code, code);
     storeIfDifferent(rec.freq_code, freqCode);
 }
 
 // Returns the code of the first record with this key; the scan ends at an end
 // record or, when no plan was laid down yet, after the last record.
-int findCode(int32_t key) {
-    for (int i = 0; i < MiniToneGenerator::NUM_TONE_DESCRIPTORS; ++i) {
-        const MiniToneGenerator::ToneDescriptor& rec = MiniToneGenerator::sToneDescriptors[i];
-        if (rec.code >= MiniToneGenerator::TONE_CODE_END) return static_cast<int>(rec.code);
+int findCode(const ToneDescriptor* table, int32_t key) {
+    for (int i = 0; i < kTableRecords; ++i) {
+        const ToneDescriptor& rec = table[i];
+        if (rec.code >= kEndCode) return static_cast<int>(rec.code);
         if (rec.freq_code == key) return static_cast<int>(rec.code);
     }
-    return static_cast<int>(MiniToneGenerator::TONE_CODE_END);
+    return static_cast<int>(kEndCode);
 }
 
 }  // namespace
 
-MiniToneGenerator::ToneDescriptor MiniToneGenerator::sToneDescriptors[NUM_TONE_DESCRIPTORS];
-
-int MiniToneGenerator::generateToneTable_ZORV() {
-    const int kCodes = 40;
+int layDownSingleFrequencyPlan(ToneDescriptor* table) {
+    const int kCodes = kPlanCodes;
     __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] sample_interval_HZ :%f , SAMPLE_RATE : %d\n", kTag,
                         static_cast<double>(kSampleIntervalHz), kSampleRate);
     for (int i = 0; i < kCodes; ++i) {
-        const int k = 30 + 10 * i;
+        const int k = codeIndex(i);
         const int f = indexToHz(k);
-        const int key = 30000 + 10000 * i;
-        ToneDescriptor& rec = sToneDescriptors[i];
+        const int key = k * 1000;
+        ToneDescriptor& rec = table[i];
         writeFirstSegment(rec, f, 0);
         __android_log_print(ANDROID_LOG_DEBUG, kTag,
                             "{ segments: { { duration: MiniToneGenerator::TONEGEN_INF, waveFreq: { %d, 0, 0 }, 0, 0 }},\n",
@@ -79,13 +77,13 @@ int MiniToneGenerator::generateToneTable_ZORV() {
         __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] freq1_index = %d(%d)Hz\n", kTag, k, f);
         __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] index = %d\n", kTag, i);
     }
-    writeCodes(sToneDescriptors[kCodes], TONE_CODE_END, FREQ_CODE_END);
+    writeCodes(table[kCodes], kEndCode, kEndFreqCode);
     __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] out of index = %d\n", kTag, kCodes);
     __android_log_print(ANDROID_LOG_DEBUG, kTag, "END MAKING Tone Generate Table\n");
     return kCodes - 1;
 }
 
-int MiniToneGenerator::generateToneTable() {
+int layDownTwoFrequencyPlan(ToneDescriptor* table) {
     __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] sample_interval_HZ :%f , SAMPLE_RATE : %d\n", kTag,
                         static_cast<double>(kSampleIntervalHz), kSampleRate);
     int c = 0;
@@ -94,7 +92,7 @@ int MiniToneGenerator::generateToneTable() {
         for (int l = 15; l <= 85; l += 10) {
             const int fl = indexToHz(l);
             const int key = l * 1000 + h;
-            ToneDescriptor& rec = sToneDescriptors[c];
+            ToneDescriptor& rec = table[c];
             writeFirstSegment(rec, fl, fh);
             __android_log_print(ANDROID_LOG_DEBUG, kTag,
                                 "{ segments: { { duration: MiniToneGenerator::TONEGEN_INF, waveFreq: { %d, %d, 0 }, 0, 0 }},\n",
@@ -108,24 +106,20 @@ int MiniToneGenerator::generateToneTable() {
             ++c;
         }
     }
-    writeCodes(sToneDescriptors[c], TONE_CODE_END, FREQ_CODE_END);
+    writeCodes(table[c], kEndCode, kEndFreqCode);
     __android_log_print(ANDROID_LOG_DEBUG, kTag, "END MAKING Tone Generate Table\n");
     return c - 1;
 }
 
-int MiniToneGenerator::getFreqTableSize() { return NUM_TONE_DESCRIPTORS; }
-
-int MiniToneGenerator::getMaxToneIndex() { return static_cast<int>(mMaxToneIndex); }
-
-int MiniToneGenerator::getFreqCodeFromIndex(int index) {
+int freqCodeAt(const ToneDescriptor* table, int index) {
     // An index outside the table names no record: answer 0, as records past the end do.
-    if (index < 0 || index >= NUM_TONE_DESCRIPTORS) return 0;
-    return sToneDescriptors[index].freq_code;
+    if (index < 0 || index >= kTableRecords) return 0;
+    return table[index].freq_code;
 }
 
-int MiniToneGenerator::getCodeFromTwoFreq(int first, int second) { return findCode(pairKey(first, second)); }
+int codeOfPair(const ToneDescriptor* table, int first, int second) { return findCode(table, pairKey(first, second)); }
 
-void MiniToneGenerator::fixFreq(int* first, int* second) {
+void fixPair(const ToneDescriptor* table, int* first, int* second) {
     const int a = *first;
     const int b = *second;
     // Neighbours wrap at the ends of int rather than overflow.
@@ -134,7 +128,7 @@ void MiniToneGenerator::fixFreq(int* first, int* second) {
         for (int db = -1; db <= 1; ++db) {
             const int x = step(a, da);
             const int y = step(b, db);
-            if (getCodeFromTwoFreq(x, y) != static_cast<int>(TONE_CODE_END)) {
+            if (codeOfPair(table, x, y) != static_cast<int>(kEndCode)) {
                 __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] Fix Freq Code From[%d/%d] To [%d/%d]\n", kTag, a, b,
                                     x, y);
                 *first = x;
@@ -145,4 +139,5 @@ void MiniToneGenerator::fixFreq(int* first, int* second) {
     }
 }
 
-}  // namespace android
+}  // namespace plan
+}  // namespace korvo

@@ -30,11 +30,13 @@ ChildProcess::~ChildProcess() {
         int status = 0;
         wait(5000, &status);
     }
-    if (mFd >= 0) close(mFd);
+    for (int fd : mFd) {
+        if (fd >= 0) close(fd);
+    }
 }
 
-bool ChildProcess::start(const std::string& path, const std::vector<std::string>& args,
-                         const std::vector<std::pair<std::string, std::string>>& env, std::string* error) {
+bool ChildProcess::start(const std::string& path, const std::vector<std::string>& args, const EnvList& env,
+                         const Options& options, std::string* error) {
     // Everything the child needs is built before fork: after it, only
     // async-signal-safe calls are allowed.
     std::vector<std::string> envText;
@@ -46,7 +48,9 @@ bool ChildProcess::start(const std::string& path, const std::vector<std::string>
         }
         if (!replaced) envText.push_back(entry);
     }
-    for (const auto& kv : env) envText.push_back(kv.first + "=" + kv.second);
+    for (const auto& kv : env) {
+        if (!kv.second.empty()) envText.push_back(kv.first + "=" + kv.second);
+    }
     std::vector<char*> envp;
     for (std::string& s : envText) envp.push_back(&s[0]);
     envp.push_back(nullptr);
@@ -55,52 +59,86 @@ bool ChildProcess::start(const std::string& path, const std::vector<std::string>
     for (std::string& s : argText) argv.push_back(&s[0]);
     argv.push_back(nullptr);
 
-    int fds[2];
-    if (pipe2(fds, O_CLOEXEC) != 0) {
-        if (error) *error = std::string("cannot make a pipe: ") + strerror(errno);
-        return false;
+    int pipes[2][2] = {{-1, -1}, {-1, -1}};
+    const int count = options.captureStderr ? 2 : 1;
+    for (int i = 0; i < count; ++i) {
+        if (pipe2(pipes[i], O_CLOEXEC) != 0) {
+            if (error) *error = std::string("cannot make a pipe: ") + strerror(errno);
+            for (auto& p : pipes) {
+                for (int fd : p) {
+                    if (fd >= 0) close(fd);
+                }
+            }
+            return false;
+        }
     }
     pid_t parent = getpid();
     pid_t pid = fork();
-    if (pid < 0) {
-        if (error) *error = std::string("cannot fork: ") + strerror(errno);
-        close(fds[0]);
-        close(fds[1]);
-        return false;
-    }
     if (pid == 0) {
         prctl(PR_SET_PDEATHSIG, SIGTERM);
         if (getppid() != parent) _exit(127);  // the parent is already gone
-        dup2(fds[1], STDOUT_FILENO);          // dup2 clears close-on-exec on descriptor 1
+        dup2(pipes[0][1], STDOUT_FILENO);     // dup2 clears close-on-exec on the copy
+        if (count == 2) dup2(pipes[1][1], STDERR_FILENO);
+        if (options.nullStdin) {
+            int devnull = open("/dev/null", O_RDONLY);
+            if (devnull >= 0) dup2(devnull, STDIN_FILENO);
+        }
         execve(path.c_str(), argv.data(), envp.data());
         _exit(127);
     }
-    close(fds[1]);
+    for (int i = 0; i < count; ++i) close(pipes[i][1]);
+    if (pid < 0) {
+        if (error) *error = std::string("cannot fork: ") + strerror(errno);
+        for (int i = 0; i < count; ++i) close(pipes[i][0]);
+        return false;
+    }
     mPid = pid;
-    mFd = fds[0];
-    mPending.clear();
+    mFd[0] = pipes[0][0];
+    mFd[1] = pipes[1][0];
+    mText[0].clear();
+    mText[1].clear();
+    mTaken = 0;
     return true;
 }
 
-bool ChildProcess::readLines(std::vector<std::string>* lines) {
-    if (mFd < 0) return false;
-    char buf[4096];
-    ssize_t n = read(mFd, buf, sizeof buf);
-    if (n < 0 && (errno == EINTR || errno == EAGAIN)) return true;
-    if (n <= 0) {
-        if (!mPending.empty()) lines->push_back(mPending);
-        mPending.clear();
-        close(mFd);
-        mFd = -1;
-        return false;
+bool ChildProcess::pump(int timeoutMs) {
+    pollfd fds[2];
+    int which[2];
+    nfds_t n = 0;
+    for (int i = 0; i < 2; ++i) {
+        if (mFd[i] < 0) continue;
+        fds[n] = {mFd[i], POLLIN, 0};
+        which[n++] = i;
     }
-    mPending.append(buf, static_cast<size_t>(n));
-    size_t start = 0;
-    for (size_t nl; (nl = mPending.find('\n', start)) != std::string::npos; start = nl + 1) {
-        lines->push_back(mPending.substr(start, nl - start));
+    if (n == 0) return false;
+    if (poll(fds, n, timeoutMs) <= 0) return true;
+    for (nfds_t k = 0; k < n; ++k) {
+        if (fds[k].revents == 0) continue;
+        const int i = which[k];
+        char buf[4096];
+        ssize_t got = read(mFd[i], buf, sizeof buf);
+        if (got < 0 && (errno == EINTR || errno == EAGAIN)) continue;
+        if (got <= 0) {
+            close(mFd[i]);
+            mFd[i] = -1;
+            continue;
+        }
+        mText[i].append(buf, static_cast<size_t>(got));
     }
-    mPending.erase(0, start);
-    return true;
+    return outputOpen();
+}
+
+std::vector<std::string> ChildProcess::takeLines() {
+    std::vector<std::string> lines;
+    const std::string& text = mText[0];
+    for (size_t nl; (nl = text.find('\n', mTaken)) != std::string::npos; mTaken = nl + 1) {
+        lines.push_back(text.substr(mTaken, nl - mTaken));
+    }
+    if (mFd[0] < 0 && mTaken < text.size()) {
+        lines.push_back(text.substr(mTaken));
+        mTaken = text.size();
+    }
+    return lines;
 }
 
 void ChildProcess::sendSignal(int sig) {

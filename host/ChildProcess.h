@@ -1,4 +1,6 @@
-// A child process whose standard output the parent reads line by line.
+// A child process with its standard output (and optionally its standard error) on
+// pipes that the parent reads, with bounded waits. Used by the demo for its devices
+// and by the tests for the soundmeter command.
 #pragma once
 #include <sys/types.h>
 
@@ -9,34 +11,48 @@
 namespace korvo {
 namespace host {
 
+// Variables added to the child's environment; an empty value removes the variable.
+using EnvList = std::vector<std::pair<std::string, std::string>>;
+
 class ChildProcess {
 public:
+    struct Options {
+        bool captureStderr = false;  // else stderr is shared with the parent
+        bool nullStdin = false;      // else stdin is shared with the parent
+    };
+
     ChildProcess() = default;
     ChildProcess(const ChildProcess&) = delete;
     ChildProcess& operator=(const ChildProcess&) = delete;
     ~ChildProcess();  // a child still running is killed and reaped
 
-    // Runs `path` with `args` (args[0] included) and the parent's environment plus
-    // `env`; stdin and stderr are shared, stdout is a pipe. The child gets SIGTERM
-    // if the parent dies first.
-    bool start(const std::string& path, const std::vector<std::string>& args,
-               const std::vector<std::pair<std::string, std::string>>& env, std::string* error);
+    // Runs `path` with `args` (args[0] included) and the parent's environment changed
+    // by `env`. The child gets SIGTERM if the parent dies first.
+    bool start(const std::string& path, const std::vector<std::string>& args, const EnvList& env,
+               const Options& options, std::string* error);
 
-    int stdoutFd() const { return mFd; }
-    // Reads what the pipe holds now and appends the complete lines; false once the
-    // child has closed its end (the rest, if unterminated, is appended too).
-    bool readLines(std::vector<std::string>* lines);
+    int stdoutFd() const { return mFd[0]; }
+    // Waits up to timeoutMs for output and appends what the pipes hold to out() and
+    // err(); false once every pipe is closed.
+    bool pump(int timeoutMs);
+    const std::string& out() const { return mText[0]; }
+    const std::string& err() const { return mText[1]; }
+    // Takes the complete lines of stdout collected so far (and the unterminated rest
+    // once the pipe is closed).
+    std::vector<std::string> takeLines();
+    bool outputOpen() const { return mFd[0] >= 0 || mFd[1] >= 0; }
 
     void sendSignal(int sig);
-    // Reaps the child within timeoutMs; true with its exit status (128 + signal
-    // when a signal ended it).
+    // Reaps the child within timeoutMs; true with its exit status (128 + signal when a
+    // signal ended it).
     bool wait(int timeoutMs, int* status);
     bool running() const { return mPid > 0; }
 
 private:
     pid_t mPid = -1;
-    int mFd = -1;
-    std::string mPending;
+    int mFd[2] = {-1, -1};  // stdout, stderr
+    std::string mText[2];
+    size_t mTaken = 0;  // stdout text already handed out as lines
 };
 
 // The path of this executable, for re-executing itself.

@@ -3,14 +3,9 @@
 namespace korvo {
 namespace host {
 
-int codeOfIndex(int index) {
-    if (index < 30 || index > 420 || index % 10 != 0) return -1;
-    return (index - 30) / 10;
-}
-
 const char* codeReach(int code) {
     if (codeHearable(code)) return "can be heard";
-    if (code >= 0 && code <= kLastMaskedCode) return "is masked out by the read-out and cannot be heard";
+    if (korvo::codeInSpectrum(code)) return "is masked out by the read-out and cannot be heard";
     return "lies beyond the spectrum and cannot be heard";
 }
 

@@ -1,20 +1,25 @@
-// The host's view of the single-frequency code plan: code c is played at
-// 86 * (30 + 10c) Hz and found by the masked read-out at spectrum index 30 + 10c.
+// The host's view of the code plan and the masked read-out, from the numbers the
+// plug-in shares with its hosts (interface/SoundMeterConstants.h).
 #pragma once
+#include "interface/SoundMeterConstants.h"
 
 namespace korvo {
 namespace host {
 
-constexpr int kCodeCount = 40;       // codes 0..39 exist in the plan
-constexpr int kHearableCodes = 18;   // codes 0..17 survive the masked read-out
-constexpr int kLastMaskedCode = 22;  // 18..22 lie inside the 256 bins but are masked out
+using korvo::codeHearable;
+using korvo::codeHz;
+using korvo::codeIndex;
+using korvo::codeOfIndex;
 
-inline int codeIndex(int code) { return 30 + 10 * code; }
-inline int codeHz(int code) { return 86 * codeIndex(code); }
-inline bool codeHearable(int code) { return code >= 0 && code < kHearableCodes; }
+constexpr int kCodeCount = korvo::kPlanCodes;
 
-// Code named by a spectrum index, or -1 when the index is no code of the plan.
-int codeOfIndex(int index);
+// Number of codes heard through the masked read-out: they come first in the plan.
+constexpr int hearableCodeCount() {
+    int n = 0;
+    while (n < kCodeCount && codeHearable(n)) ++n;
+    return n;
+}
+constexpr int kHearableCodes = hearableCodeCount();  // 18: codes 0..17
 
 // Why a code can or cannot be heard, in a few words, for messages.
 const char* codeReach(int code);

@@ -41,10 +41,11 @@ struct DemoOptions {
 const double kToneDbfs = 20.0 * std::log10(14744.0 / 32768.0 / std::sqrt(2.0));
 
 // Mean level of one spectrum bin under white noise of the given dBFS: each bin of
-// the 512-point transform of noise with RMS s (full scale 1) has an RMS magnitude
-// of sqrt(512) * s, which the analyser divides by 325.6832.
+// the frame's transform of noise with RMS s (full scale 1) has an RMS magnitude of
+// sqrt(frame length) * s, which the analyser divides by its magnitude divisor.
 double noiseBinLevel(double noiseDbfs) {
-    double magnitude = std::sqrt(512.0) * std::pow(10.0, noiseDbfs / 20.0) / 325.6832;
+    double magnitude = std::sqrt(double(korvo::kFrameSamples)) * std::pow(10.0, noiseDbfs / 20.0) /
+                       double(korvo::kMagnitudeDivisor);
     return 100.0 * (1.0 + std::log10(magnitude) / 6.0);
 }
 
@@ -102,7 +103,7 @@ private:
         if (mOpt.snrGiven) args.push_back("--level=" + std::to_string(detectionLevelFor(mNoiseDbfs)));
         for (int i = 0; i < mCommon.verbose; ++i) args.push_back("-v");
         if (!mCommon.plugin.empty()) args.push_back("--plugin=" + mCommon.plugin);
-        std::vector<std::pair<std::string, std::string>> env;
+        EnvList env;
         // Each device's microphone hears noise of its own.
         env.emplace_back("KORVO_SIM_SEED", who == kListener ? "11" : "22");
         // The demo decides the noise: none unless --snr asks for it (an empty value is none).
@@ -110,7 +111,7 @@ private:
         if (mOpt.snrGiven) snprintf(level, sizeof level, "%.2f", mNoiseDbfs);
         env.emplace_back("KORVO_SIM_NOISE", level);
         std::string error;
-        if (!mChild[who].start(selfExecutable(), args, env, &error)) {
+        if (!mChild[who].start(selfExecutable(), args, env, ChildProcess::Options{}, &error)) {
             errf("cannot start the %s: %s", kWhoName[who], error.c_str());
             return false;
         }
@@ -147,9 +148,9 @@ private:
             if (poll(fds, n, 100) <= 0) continue;
             for (nfds_t i = 0; i < n; ++i) {
                 if (fds[i].revents == 0) continue;
-                std::vector<std::string> lines;
-                if (!mChild[who[i]].readLines(&lines)) mOpen[who[i]] = false;
-                for (const std::string& line : lines) onLine(static_cast<Who>(who[i]), line);
+                ChildProcess& child = mChild[who[i]];
+                if (!child.pump(0)) mOpen[who[i]] = false;
+                for (const std::string& line : child.takeLines()) onLine(static_cast<Who>(who[i]), line);
             }
             // The speaker starts once the listener is ready; a listener that ended
             // without getting ready ends the demo.

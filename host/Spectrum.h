@@ -1,13 +1,14 @@
 // One look at the live spectrum through the interface: the masked read-out and
 // the detector that the handshake itself uses.
 #pragma once
+#include "interface/SoundMeterConstants.h"
 #include "interface/SoundMeter_vir.h"
 
 namespace korvo {
 namespace host {
 
 struct SpectrumLook {
-    float levels[256];   // the masked read-out; entry 30 + 10c is the band of code c
+    float levels[korvo::kSpectrumBins];   // the masked read-out; entry 30 + 10c is the band of code c
     int bins = 0;        // bins with a positive level; 0 before the analysis has a frame
     int first = -1;      // the two peak indices, sorted, as the detector reports them
     int second = -1;

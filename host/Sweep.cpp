@@ -106,7 +106,7 @@ int runSweep(const CommonOptions& common, const SweepOptions& o) {
             outf("%8.3f s  said code %d (%d Hz)%s\n", (monotonicMs() - start) / 1000.0, code,
                  code < kCodeCount ? codeHz(code) : 0, codeHearable(code) ? "" : ", cannot be heard");
             if (!o.noAck) {
-                awaiting = (code + 1) % 512;
+                awaiting = korvo::acknowledgementOf(code);
                 awaitUntil = monotonicMs() + o.ms + kAnswerWaitMs;
             }
         }

@@ -1,18 +1,12 @@
 // The meter object's ownership of the process-wide analysis thread, and the
 // operations that forward to it.
-#include <log/log.h>
-
 #include "analysis/WaveformCanvas.h"
 #include "capture/FrameExchange.h"
+#include "interface/LogTags.h"
 #include "meter/SoundMeter.h"
 
-namespace {
-const char* const kTag = "TQX";
-const char* const kWho = "SoundMeter";
-}  // namespace
-
 void SoundMeter::start_wf_thread() {
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] start_wf_thread", kWho);
+    METER_LOGD("[%s] start_wf_thread");
     if (WF_Thread != nullptr) return;
     WF_Thread = new android::WaveformCanvas();
     WF_Thread->run("WaveformCanvas", 0, 0);
@@ -21,11 +15,11 @@ void SoundMeter::start_wf_thread() {
 void SoundMeter::end_wf_thread() {
     if (WF_Thread != nullptr) {
         WF_Thread->requestExitAndWait();
-        __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] WF_Thread threadLoop finished", kWho);
+        METER_LOGD("[%s] WF_Thread threadLoop finished");
         WF_Thread->release();
         WF_Thread.clear();
     }
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] end_wf_thread", kWho);
+    METER_LOGD("[%s] end_wf_thread");
 }
 
 bool SoundMeter::getStateWFthread() { return WF_Thread != nullptr; }

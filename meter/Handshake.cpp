@@ -3,9 +3,9 @@
 #include <cstdio>
 #include <cstring>
 
-#include <log/log.h>
 #include <utils/Timers.h>
 
+#include "interface/LogTags.h"
 #include "meter/Handshake.h"
 #include "meter/SoundMeter.h"
 #include "tone/MiniToneGenerator.h"
@@ -15,12 +15,10 @@ int64_t last_play_time = 0;
 
 namespace {
 
-const char* const kTag = "TQX";
-const char* const kWho = "SoundMeter";
 const char* const kSayFunc = "virtual void SoundMeter::SayFreqIdx(int, int)";
 const int kListenerBit = 1;
 const int kSpeakerBit = 2;
-const int kTableSize = 512;
+const int kTableSize = android::MiniToneGenerator::NUM_TONE_DESCRIPTORS;
 
 long nowMs() { return static_cast<long>(systemTime(SYSTEM_TIME_MONOTONIC) / 1000000); }
 
@@ -47,10 +45,10 @@ int SoundMeter::HearFreqIdx(int toneIndex) {
     processAudio();
     if (!korvo::hearingGateOpen(*this)) return -1;
 
-    float spectrum[256];
+    float spectrum[korvo::kSpectrumBins];
     memset(spectrum, 0, sizeof(spectrum));
     if (getSpectrumData_zorv(spectrum) == 0) {
-        __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] PCM Analysis not prepared\n", kWho);
+        METER_LOGD("[%s] PCM Analysis not prepared\n");
         return -1;
     }
     int first = -1;
@@ -67,21 +65,19 @@ int SoundMeter::HearFreqIdx(int toneIndex) {
         } else {
             listener_state = 10;
         }
-        __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s:%d] TIME [%ld] Listener Transit To %d\n", kWho, 530,
+        METER_LOGD("[%s:%d] TIME [%ld] Listener Transit To %d\n", 530,
                             nowMs(), listener_state);
     } else if ((role & kSpeakerBit) && speaker_state == 1) {
         if (toneIndex == korvo::acknowledgementOf(last_said, android::MiniToneGenerator::getFreqTableSize())) {
             speaker_state = 10;
         }
-        __android_log_print(ANDROID_LOG_DEBUG, kTag,
-                            "[%s:%d] TIME [%ld] Speaker Transit To %d.Heard [%d] last_said[%d]\n", kWho, 538,
+        METER_LOGD("[%s:%d] TIME [%ld] Speaker Transit To %d.Heard [%d] last_said[%d]\n", 538,
                             nowMs(), speaker_state, toneIndex, last_said);
     }
     if (listener_state == 10 && speaker_state == 10) {
         listener_state = 0;
         speaker_state = 0;
-        __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s:%d] TIME [%ld] Listener/Speaker Transit To %d/%d\n",
-                            kWho, 548, nowMs(), 0, 0);
+        METER_LOGD("[%s:%d] TIME [%ld] Listener/Speaker Transit To %d/%d\n", 548, nowMs(), 0, 0);
     }
     return toneIndex;
 }
@@ -90,20 +86,19 @@ int SoundMeter::HearAndResponse() {
     count += 1;
     processAudio();
     if (korvo::hearingGateOpen(*this)) {
-        float spectrum[256];
+        float spectrum[korvo::kSpectrumBins];
         memset(spectrum, 0, sizeof(spectrum));
         if (getSpectrumData(spectrum) == 0) {
-            __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] PCM Analysis not prepared\n", kWho);
+            METER_LOGD("[%s] PCM Analysis not prepared\n");
         }
     }
     return -1;
 }
 
 void SoundMeter::SayFreqIdx(int toneIndex, int durationMs) {
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s][%s][START] speaker_state:%d listener_state:%d\n", kWho,
-                        kSayFunc, speaker_state, listener_state);
+    METER_LOGD("[%s][%s][START] speaker_state:%d listener_state:%d\n", kSayFunc, speaker_state, listener_state);
     if (!korvo::sayingGateOpen(*this)) {
-        __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] state ERROR!\n", kWho);
+        METER_LOGD("[%s] state ERROR!\n");
     } else {
         // Without a tone generator there is nothing to play; the states still move as after a tone.
         if (toneGenerator != nullptr) toneGenerator->startTone(toneIndex, durationMs);
@@ -122,8 +117,7 @@ void SoundMeter::SayFreqIdx(int toneIndex, int durationMs) {
             listener_state = 0;
         }
     }
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s][%s][END] speaker_state = %d, listener_state = %d\n", kWho,
-                        kSayFunc, speaker_state, listener_state);
+    METER_LOGD("[%s][%s][END] speaker_state = %d, listener_state = %d\n", kSayFunc, speaker_state, listener_state);
 }
 
 void SoundMeter::SayAllFreqIndex(int durationMs) {
@@ -131,11 +125,11 @@ void SoundMeter::SayAllFreqIndex(int durationMs) {
     if (role == 2 && last_play_time != 0) {
         const long elapsed = static_cast<long>((systemTime(SYSTEM_TIME_MONOTONIC) - last_play_time) / 1000000);
         printf("[%s] SoundMeter Works as Speaker Only, then it'll not say before sleeping saytime+50msec.[%ld]\n",
-               kWho, elapsed);
+               korvo::kMeterWho, elapsed);
         if (elapsed < durationMs + 350 && speaker_state == 10) return;
         speaker_state = 0;
         play_sound += 1;
-        printf("[%s:%d] TIME [%ld] Speaker Transit To %d\n", kWho, 884, nowMs(), 0);
+        printf("[%s:%d] TIME [%ld] Speaker Transit To %d\n", korvo::kMeterWho, 884, nowMs(), 0);
     }
     if (!korvo::sayingGateOpen(*this)) return;
 
@@ -149,28 +143,28 @@ void SoundMeter::SayAllFreqIndex(int durationMs) {
     }
     if (listener_state == 1 && need_ack == 1) {
         play_sound = korvo::acknowledgementOf(last_heard, android::MiniToneGenerator::getFreqTableSize());
-        printf("[%s:%d] TIME [%ld] Listener Transit To %d. last_heard[%d] play_sound[%d]\n", kWho, 911, nowMs(),
+        printf("[%s:%d] TIME [%ld] Listener Transit To %d. last_heard[%d] play_sound[%d]\n", korvo::kMeterWho, 911, nowMs(),
                listener_state, last_heard, play_sound);
     }
     last_said = play_sound;
     if (toneGenerator != nullptr) toneGenerator->startTone(play_sound, durationMs);
-    printf("[%s] CNT TIME TONE PLAYING[%d:%d]------------[%ld] From Prev Play [%ld]\n", kWho, play_sound, code,
+    printf("[%s] CNT TIME TONE PLAYING[%d:%d]------------[%ld] From Prev Play [%ld]\n", korvo::kMeterWho, play_sound, code,
            static_cast<long>(t / 1000000), static_cast<long>((t - last_play_time) / 1000000));
     last_play_time = t;
     if ((role & kListenerBit) && listener_state == 1) {
         listener_state = 10;
         play_sound += 1;
-        printf("[%s:%d] TIME [%ld] Listener Transit To %d\n", kWho, 922, nowMs(), 10);
+        printf("[%s:%d] TIME [%ld] Listener Transit To %d\n", korvo::kMeterWho, 922, nowMs(), 10);
     }
     if ((role & kSpeakerBit) && speaker_state == 0) {
         speaker_state = need_ack == 1 ? 1 : 10;
         play_sound += 1;
-        printf("[%s:%d] TIME [%ld] Speaker Transit To %d\n", kWho, 937, nowMs(), speaker_state);
+        printf("[%s:%d] TIME [%ld] Speaker Transit To %d\n", korvo::kMeterWho, 937, nowMs(), speaker_state);
     }
 }
 
 void SoundMeter::setSpeakerState(int state) {
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] set speaker state: %d", kWho, state);
+    METER_LOGD("[%s] set speaker state: %d", state);
     speaker_state = state;
 }
 

@@ -1,19 +1,13 @@
 // The meter object: construction, destruction and the small accessors.
 #include "meter/SoundMeter.h"
 
-#include <log/log.h>
-
 #include "capture/CaptureStream.h"
-
-namespace {
-const char* const kTag = "TQX";
-const char* const kWho = "SoundMeter";
-}  // namespace
+#include "interface/LogTags.h"
 
 SoundMeter::SoundMeter()
-    : sampleRate(44100),
+    : sampleRate(korvo::kSampleRate),
       bufferSize(0),
-      frameSamples(512),
+      frameSamples(korvo::kFrameSamples),
       sleep(0),
       ringIndex(0),
       frameFill(0),
@@ -31,19 +25,17 @@ SoundMeter::SoundMeter()
       audioRecord(nullptr),
       toneGenerator(nullptr),
       recordFrameCount(0) {
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] SoundMeter start!", kWho);
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] audio_is_input_channel succeeded", kWho);
+    METER_LOGD("[%s] SoundMeter start!");
+    METER_LOGD("[%s] audio_is_input_channel succeeded");
     // 16 = mono input, 2 = 16-bit PCM. A failed query (-1) leaves -2 here; startRecord copes with it.
     bufferSize = 2 * AudioRecord_getMinBufferSize(sampleRate, 16, 2);
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] bufferSize=%d", kWho, bufferSize);
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] nbChannels=0x%x, bytesPerSample=0x%x", kWho, 1, 2);
+    METER_LOGD("[%s] bufferSize=%d", bufferSize);
+    METER_LOGD("[%s] nbChannels=0x%x, bytesPerSample=0x%x", 1, 2);
     // Frame period in whole milliseconds, in single precision: 1000 / 86.1328125 = 11.6 → 11.
     sleep = static_cast<int64_t>(1000.0f / (static_cast<float>(sampleRate) / static_cast<float>(frameSamples)));
     recordFrameCount = bufferSize / 2;
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] AudioRecord Set succeeded. sleep set to %ld", kWho,
-                        static_cast<long>(sleep));
-    __android_log_print(ANDROID_LOG_DEBUG, kTag, "[%s] AudioRecord Set succeeded. sleep set to %ld\n", kWho,
-                        static_cast<long>(sleep));
+    METER_LOGD("[%s] AudioRecord Set succeeded. sleep set to %ld", static_cast<long>(sleep));
+    METER_LOGD("[%s] AudioRecord Set succeeded. sleep set to %ld\n", static_cast<long>(sleep));
     ringIndex.store(0, std::memory_order_relaxed);
     frameFill.store(0, std::memory_order_relaxed);
 }

@@ -1,6 +1,8 @@
 // The meter object: the one concrete class behind SoundMeter_vir. It holds the
 // capture settings and five-frame ring, the capture stream, the tone generator
 // and the handshake state. The analysis thread is process-wide (WF_Thread).
+// Capture stays in capture/ (the ring is a field of this object); every other
+// member is defined in meter/, in the file each group below names.
 #pragma once
 #include <atomic>
 #include <cstdint>
@@ -8,6 +10,7 @@
 #include <media/AudioRecord.h>
 #include <utils/StrongPointer.h>
 
+#include "interface/SoundMeterConstants.h"
 #include "interface/SoundMeter_vir.h"
 
 namespace android {
@@ -19,16 +22,16 @@ public:
     SoundMeter();
     ~SoundMeter() override;
 
-    // Tone generator ownership.
+    // Tone generator ownership: meter/ToneGeneratorOwnership.cpp.
     void makeToneGenerator(audio_stream_type_t streamType) override;
     void releaseToneGenerator() override;
-    // Capture.
+    // Capture: capture/CaptureStream.cpp and capture/CaptureLoop.cpp.
     void processAudio() override;
     void stopAudio() override;
     int getRecordState() override;
     void startRecord() override;
     void stopRecord() override;
-    // Analysis thread ownership and forwarders.
+    // Analysis thread ownership and its forwarders: meter/AnalysisThreadOwnership.cpp.
     void setActive(bool on) override;
     int getDetectionLevel() override;
     void setDetectionLevel(int level) override;
@@ -37,12 +40,12 @@ public:
     bool getStateWFthread() override;
     int getSpectrumData(float* out) override;
     int getSpectrumData_zorv(float* out) override;
-    // Accessors.
+    // Construction and accessors: meter/SoundMeter.cpp.
     void setNeedAck(bool on) override;
     void setRole(int mask) override;
     int getRole() override;
     int getCount() override;
-    // Handshake.
+    // Handshake: meter/Handshake.cpp.
     void SayAllFreqIndex(int durationMs) override;
     void SayFreqIdx(int toneIndex, int durationMs) override;
     int SayString(char* text) override;
@@ -50,7 +53,7 @@ public:
     int HearFreqIdx(int toneIndex) override;
     void stopFreqTone() override;
     void setSpeakerState(int state) override;
-    // Detection and voting.
+    // Detection and voting, forwarded to detection/: meter/DetectionForwarders.cpp.
     float detectPeakFreq(float* spectrum, int start, int* index) override;
     float detectPeakFreq_zorv(float* spectrum, int start, int* index) override;
     float detectSecondPeakFreq_zorv(float* spectrum, int first, int* index) override;
@@ -58,7 +61,7 @@ public:
     void detectTwoPeakFreq_zorv(float unused, float* spectrum, int* first, int* second) override;
     void detectTwoPeakFrame(int* frames, int* first, int* second) override;
 
-    // Non-virtual members: code plan look-ups on the tone generator, and the vote.
+    // Non-virtual members, also in meter/DetectionForwarders.cpp: code plan look-ups and the vote.
     void fixFreq(int* first, int* second);
     int getCodeFromTwoFreq(int first, int second);
     int getFreqCodeFromIndex(int index);
@@ -70,7 +73,7 @@ public:
     int32_t bufferSize;
     int32_t frameSamples;
     int64_t sleep;
-    int16_t pcmRing[2560];
+    int16_t pcmRing[korvo::kRingSamples];
     // Reset by stopRecord, possibly on another thread while a capture step runs: relaxed atomics.
     std::atomic<int32_t> ringIndex;
     std::atomic<int32_t> frameFill;

@@ -15,17 +15,20 @@
 #include <utils/KeyedVector.h>
 #include <utils/StrongPointer.h>
 
+#include "detection/ToneCodePlan.h"
 #include "interface/Export.h"
 
 namespace android {
 
 class MiniToneGenerator {
 public:
-    static constexpr unsigned int TONEGEN_INF = 0xFFFFFFFFu;
-    static constexpr unsigned int TONE_CODE_END = 999;
-    static constexpr int FREQ_CODE_END = 99999;
-    static constexpr int NUM_TONE_DESCRIPTORS = 512;
-    static constexpr int NUM_SEGMENTS = 13;
+    static constexpr unsigned int TONEGEN_INF = korvo::plan::kToneForever;
+    static constexpr unsigned int TONE_CODE_END = korvo::plan::kEndCode;
+    static constexpr int FREQ_CODE_END = korvo::plan::kEndFreqCode;
+    static constexpr int NUM_TONE_DESCRIPTORS = korvo::plan::kTableRecords;
+    static constexpr int NUM_SEGMENTS = korvo::plan::kSegments;
+    // Output rates the wave generators can take: they hold the rate in 16 bits.
+    static constexpr uint32_t MAX_SAMPLING_RATE = 65535;
 
     enum tone_state {
         TONE_IDLE = 0,
@@ -38,17 +41,9 @@ public:
         TONE_REINIT = 7,
     };
 
-    struct ToneSegment {
-        unsigned int duration;         // ms; TONEGEN_INF plays until stopped; 0 ends the list
-        unsigned short waveFreq[4];    // Hz, list ends at the first 0
-        unsigned short loopCnt;
-        unsigned short loopIndex;
-    };
-    struct ToneDescriptor {
-        ToneSegment segments[NUM_SEGMENTS];
-        unsigned int code;
-        int freq_code;
-    };
+    // The tone table's records (the code plan's own types).
+    using ToneSegment = android::ToneSegment;
+    using ToneDescriptor = android::ToneDescriptor;
 
     // Sine oscillator in fixed point; adds its samples into a 16-bit buffer.
     class WaveGenerator {
@@ -78,7 +73,7 @@ public:
     void clearAudioTrack();
     bool initAudioTrack();
 
-    // The tone table and the code plan.
+    // The tone table and the code plan (ToneCodePlanMembers.cpp forwards to the plan's functions).
     static KORVO_EXPORT ToneDescriptor sToneDescriptors[NUM_TONE_DESCRIPTORS];
     static int generateToneTable_ZORV();
     static int generateToneTable();
@@ -120,8 +115,6 @@ public:
     KeyedVector<unsigned short, WaveGenerator*> mWaveGens;
 };
 
-static_assert(sizeof(MiniToneGenerator::ToneSegment) == 16, "ToneSegment layout");
-static_assert(sizeof(MiniToneGenerator::ToneDescriptor) == 13 * 16 + 8, "ToneDescriptor layout");
 static_assert(offsetof(MiniToneGenerator::ToneDescriptor, code) == 208, "ToneDescriptor layout");
 static_assert(offsetof(MiniToneGenerator::ToneDescriptor, freq_code) == 212, "ToneDescriptor layout");
 

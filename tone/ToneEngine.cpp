@@ -169,6 +169,13 @@ bool MiniToneGenerator::startTone(int toneType, int durationMs) {
         TONE_LOGE("startTone: output sampling rate unknown, tone refused");
         return false;
     }
+    // The wave generators take the rate in 16 bits: above it every tone would play at
+    // a wrong pitch (96000 Hz would be taken as 30464 Hz).
+    if (mSamplingRate > MAX_SAMPLING_RATE) {
+        TONE_LOGE("startTone: output sampling rate %u Hz is above %u Hz, tone refused", mSamplingRate,
+                  MAX_SAMPLING_RATE);
+        return false;
+    }
 
     uint16_t lState = mState.load(std::memory_order_relaxed);
     if (lState == TONE_IDLE || lState == TONE_REINIT) {

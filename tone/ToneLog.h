@@ -1,15 +1,11 @@
-// Log helpers of the tone engine: one tag for the engine, the callback and the
-// wave generator, and the monotonic milliseconds printed in its messages.
+// The monotonic milliseconds printed in the tone engine's messages (its tag and
+// log macros are the plug-in's, in LogTags.h).
 #pragma once
 #include <cstdint>
 
-#include <log/log.h>
 #include <utils/Timers.h>
 
-#define TONE_LOG_TAG "MiniToneGenerator"
-#define TONE_LOGD(...) __android_log_print(ANDROID_LOG_DEBUG, TONE_LOG_TAG, __VA_ARGS__)
-#define TONE_LOGW(...) __android_log_print(ANDROID_LOG_WARN, TONE_LOG_TAG, __VA_ARGS__)
-#define TONE_LOGE(...) __android_log_print(ANDROID_LOG_ERROR, TONE_LOG_TAG, __VA_ARGS__)
+#include "interface/LogTags.h"
 
 namespace android {
 

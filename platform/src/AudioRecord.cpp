@@ -130,6 +130,7 @@ status_t AudioRecord::start(AudioSystem::sync_event_t /*event*/, audio_session_t
 }
 
 void AudioRecord::stop() {
+    korvo::platform::detail::runMicStopHook();
     Impl& d = *mImpl;
     std::lock_guard<std::mutex> state(d.stateLock);
     if (d.stopped.exchange(true, std::memory_order_acq_rel)) return;

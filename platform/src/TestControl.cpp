@@ -5,6 +5,7 @@
 #include <atomic>
 #include <condition_variable>
 #include <deque>
+#include <functional>
 #include <mutex>
 
 #include "Internal.h"
@@ -32,6 +33,7 @@ struct Controls {
     std::deque<int16_t> micSamples;
     std::deque<ssize_t> micResults;
     int micWaiting = 0;  // scripted reads blocked now
+    std::function<void()> micStopHook;  // guarded by micLock
 };
 
 // Never destroyed: streams and threads may still log or stop during static destruction.
@@ -86,6 +88,16 @@ void wakeMicReaders() {
     c.micCond.notify_all();
 }
 
+void runMicStopHook() {
+    std::function<void()> hook;
+    {
+        Controls& c = controls();
+        std::lock_guard<std::mutex> lock(c.micLock);
+        hook = c.micStopHook;
+    }
+    if (hook) hook();
+}
+
 void noteMicRead(size_t bytes) { gLastMicRequest.store(bytes, std::memory_order_relaxed); }
 
 android::status_t minFrameCount(size_t* frames) {
@@ -108,6 +120,7 @@ void resetAll() {
         gScriptOn.store(false, std::memory_order_release);
         c.micSamples.clear();
         c.micResults.clear();
+        c.micStopHook = nullptr;
         c.micCond.notify_all();
     }
     gLastMicRequest.store(0, std::memory_order_relaxed);
@@ -163,6 +176,12 @@ size_t micSamplesQueued() {
     Controls& c = controls();
     std::lock_guard<std::mutex> lock(c.micLock);
     return c.micSamples.size();
+}
+
+void onMicStop(std::function<void()> hook) {
+    Controls& c = controls();
+    std::lock_guard<std::mutex> lock(c.micLock);
+    c.micStopHook = std::move(hook);
 }
 
 void setMinFrameCount(size_t frames) { gMinFrameCount.store(frames, std::memory_order_relaxed); }

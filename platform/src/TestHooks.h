@@ -23,6 +23,8 @@ bool micScriptOn();
 ssize_t scriptedMicRead(int16_t* out, size_t bytes, const std::atomic<bool>& stopped);
 // Wakes scripted reads so that they look at their stop flag again.
 void wakeMicReaders();
+// Runs the test's stop hook, if any.
+void runMicStopHook();
 // Records the size of the newest capture read.
 void noteMicRead(size_t bytes);
 

@@ -6,6 +6,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -50,6 +51,9 @@ KORVO_PLATFORM_API void pushMicResult(ssize_t result);
 KORVO_PLATFORM_API int micReadersWaiting();
 KORVO_PLATFORM_API size_t lastMicReadRequest();
 KORVO_PLATFORM_API size_t micSamplesQueued();
+// Runs inside every AudioRecord::stop(), before the stream stops (empty: nothing), so a
+// test can see what the caller had done by then.
+KORVO_PLATFORM_API void onMicStop(std::function<void()> hook);
 // Minimum frame count that getMinFrameCount reports (default 1024); a non-zero
 // status makes it fail with that status instead.
 KORVO_PLATFORM_API void setMinFrameCount(size_t frames);
