@@ -2,6 +2,8 @@
 #include <media/AudioRecord.h>
 
 #include <atomic>
+#include <chrono>
+#include <condition_variable>
 #include <cstdint>
 #include <mutex>
 #include <string>
@@ -9,6 +11,7 @@
 #include <korvo/platform/Routes.h>
 #include <log/log.h>
 
+#include "RouteStatus.h"
 #include "TestHooks.h"
 
 namespace android {
@@ -49,6 +52,26 @@ struct AudioRecord::Impl {
     void* user = nullptr;
     // True while not started; a read that sees it returns, and stop() sets it to end a read.
     std::atomic<bool> stopped{true};
+    std::string routeText;
+
+    // A read that cannot deliver (no route, not started, the route failed) returns only
+    // after the time its samples would take, as a broken microphone would; a stop ends
+    // the wait at once.
+    std::mutex paceLock;
+    std::condition_variable paceCond;
+    uint64_t stopCount = 0;  // guarded by paceLock
+
+    void paceFailedRead(size_t samples) {
+        const uint32_t rate = sampleRate != 0 ? sampleRate : kDefaultSampleRate;
+        const auto until = std::chrono::steady_clock::now() +
+                           std::chrono::microseconds(static_cast<int64_t>(samples) * 1000000 / rate);
+        std::unique_lock<std::mutex> lock(paceLock);
+        const uint64_t stops = stopCount;
+        paceCond.wait_until(lock, until, [&] { return stopCount != stops; });
+    }
+    void failed(const std::string& cause) {
+        korvo::platform::detail::noteFailure(korvo::platform::detail::Stream::Microphone, routeText + ": " + cause);
+    }
 };
 
 status_t AudioRecord::getMinFrameCount(size_t* frameCount, uint32_t /*sampleRate*/,
@@ -99,11 +122,13 @@ status_t AudioRecord::set(audio_source_t /*inputSource*/, uint32_t sampleRate, a
         return BAD_VALUE;
     }
 
-    const std::string routeText = korvo::platform::micRoute();
+    d.routeText = korvo::platform::micRoute();
+    korvo::platform::detail::noteRoute(korvo::platform::detail::Stream::Microphone, d.routeText);
     std::string error;
-    d.route = korvo::platform::makeCaptureRoute(routeText, &error);
+    d.route = korvo::platform::makeCaptureRoute(d.routeText, &error);
     if (!d.route) {
-        __android_log_print(ANDROID_LOG_ERROR, kTag, "capture route: %s", error.c_str());
+        __android_log_print(ANDROID_LOG_ERROR, kTag, "capture route %s: %s", d.routeText.c_str(), error.c_str());
+        d.failed(error);
         d.status = NO_INIT;
         return NO_INIT;
     }
@@ -122,7 +147,10 @@ status_t AudioRecord::start(AudioSystem::sync_event_t /*event*/, audio_session_t
     std::lock_guard<std::mutex> reading(d.readLock);
     const int rc = d.route->open(d.sampleRate);
     if (rc < 0) {
-        __android_log_print(ANDROID_LOG_ERROR, kTag, "capture route did not open: status %d", rc);
+        const std::string cause = d.route->failure();
+        __android_log_print(ANDROID_LOG_ERROR, kTag, "capture route %s did not open: %s (status %d)",
+                            d.routeText.c_str(), cause.c_str(), rc);
+        d.failed(cause.empty() ? "cannot open (status " + std::to_string(rc) + ")" : cause);
         return rc;
     }
     d.stopped.store(false, std::memory_order_release);
@@ -133,6 +161,11 @@ void AudioRecord::stop() {
     korvo::platform::detail::runMicStopHook();
     Impl& d = *mImpl;
     std::lock_guard<std::mutex> state(d.stateLock);
+    {
+        std::lock_guard<std::mutex> pace(d.paceLock);
+        ++d.stopCount;
+    }
+    d.paceCond.notify_all();
     if (d.stopped.exchange(true, std::memory_order_acq_rel)) return;
     if (d.route) d.route->stop();
     korvo::platform::detail::wakeMicReaders();
@@ -142,20 +175,36 @@ bool AudioRecord::stopped() const { return mImpl->stopped.load(std::memory_order
 
 ssize_t AudioRecord::read(void* buffer, size_t size, bool blocking) {
     Impl& d = *mImpl;
-    if (d.status != OK) return NO_INIT;
+    const size_t samples = size / sizeof(int16_t);
+    if (d.status != OK) {
+        d.paceFailedRead(samples);
+        return NO_INIT;
+    }
     // The library reads synchronously only; a non-blocking read has nothing to offer here.
     if (!blocking) return INVALID_OPERATION;
     if (!buffer || reinterpret_cast<uintptr_t>(buffer) % alignof(int16_t) != 0) return BAD_VALUE;
     korvo::platform::detail::noteMicRead(size);
-
-    std::lock_guard<std::mutex> reading(d.readLock);
-    if (d.stopped.load(std::memory_order_acquire)) return 0;
     auto* out = static_cast<int16_t*>(buffer);
     if (korvo::platform::detail::micScriptOn()) {
+        std::lock_guard<std::mutex> reading(d.readLock);
+        if (d.stopped.load(std::memory_order_acquire)) return 0;
         return korvo::platform::detail::scriptedMicRead(out, size, d.stopped);
     }
-    const ssize_t n = d.route->read(out, size / sizeof(int16_t));
-    return n < 0 ? n : n * static_cast<ssize_t>(sizeof(int16_t));
+
+    ssize_t n = 0;
+    {
+        std::lock_guard<std::mutex> reading(d.readLock);
+        if (!d.stopped.load(std::memory_order_acquire)) {
+            n = d.route->read(out, samples);
+            if (n < 0) d.failed(d.route->failure());
+            const korvo::platform::SourceProgress progress = d.route->progress();
+            if (progress.finite) korvo::platform::detail::noteProgress(progress);
+            if (n >= 0) return n * static_cast<ssize_t>(sizeof(int16_t));
+        }
+    }
+    // Not started (or stopped) or failed: nothing to deliver, at the pace of a microphone.
+    d.paceFailedRead(samples);
+    return n;
 }
 
 size_t AudioRecord::frameCount() const { return mImpl->frameCount; }

@@ -4,6 +4,7 @@
 #include <media/AudioTrack.h>
 
 #include <algorithm>
+#include <chrono>
 #include <mutex>
 #include <string>
 #include <thread>
@@ -12,6 +13,7 @@
 #include <log/log.h>
 #include <media/AudioSystem.h>
 
+#include "RouteStatus.h"
 #include "TrackShared.h"
 
 namespace android {
@@ -123,17 +125,24 @@ status_t AudioTrack::set(audio_stream_type_t streamType, uint32_t sampleRate, au
             return d.status;
         }
     }
+    using korvo::platform::detail::Stream;
+    const std::string routeText = korvo::platform::speakerRoute();
+    korvo::platform::detail::noteRoute(Stream::Speaker, routeText);
     std::string error;
-    std::unique_ptr<korvo::platform::OutputRoute> route =
-        korvo::platform::makeOutputRoute(korvo::platform::speakerRoute(), &error);
+    std::unique_ptr<korvo::platform::OutputRoute> route = korvo::platform::makeOutputRoute(routeText, &error);
     if (!route) {
-        __android_log_print(ANDROID_LOG_ERROR, kTag, "set: %s", error.c_str());
+        __android_log_print(ANDROID_LOG_ERROR, kTag, "set: speaker route %s: %s", routeText.c_str(), error.c_str());
+        korvo::platform::detail::noteFailure(Stream::Speaker, routeText + ": " + error);
         d.status = BAD_VALUE;
         return BAD_VALUE;
     }
     int opened = route->open(rate);
     if (opened != 0) {
-        __android_log_print(ANDROID_LOG_ERROR, kTag, "set: cannot open the speaker route (%d)", opened);
+        const std::string cause = route->failure();
+        __android_log_print(ANDROID_LOG_ERROR, kTag, "set: speaker route %s did not open: %s (status %d)",
+                            routeText.c_str(), cause.c_str(), opened);
+        korvo::platform::detail::noteFailure(
+            Stream::Speaker, routeText + ": " + (cause.empty() ? "cannot open (status " + std::to_string(opened) + ")" : cause));
         d.status = BAD_VALUE;
         return BAD_VALUE;
     }
@@ -142,6 +151,7 @@ status_t AudioTrack::set(audio_stream_type_t streamType, uint32_t sampleRate, au
     d.core->user = user;
     d.core->sampleRate = rate;
     d.core->route = std::move(route);
+    d.core->routeText = routeText;
     d.configured = true;
     d.status = OK;
     return OK;
@@ -223,13 +233,23 @@ size_t runTrackCallback(TrackCore& core, std::vector<int16_t>& buffer, size_t sa
     if (core.cbf) core.cbf(android::AudioTrack::EVENT_MORE_DATA, core.user, &b);
     size_t produced = std::min(b.size, samples * sizeof(int16_t)) / sizeof(int16_t);
     if (!core.route) return b.size;
+    int written;
     if (produced != 0) {
-        core.route->write(buffer.data(), produced);
+        written = core.route->write(buffer.data(), produced);
     } else {
         // Nothing produced: the timeline goes on with silence, written from the same buffer
         // so that the playback thread allocates nothing per callback.
         std::fill(buffer.begin(), buffer.end(), 0);
-        core.route->write(buffer.data(), samples);
+        written = core.route->write(buffer.data(), samples);
+    }
+    if (written < 0) {
+        noteFailure(Stream::Speaker, core.routeText + ": " + core.route->failure());
+        // A broken loudspeaker: the callbacks keep their real-time pace, nothing is played.
+        const size_t n = produced != 0 ? produced : samples;
+        TrackControl& tc = trackControl();
+        std::unique_lock<std::mutex> lk(tc.stateMutex);
+        tc.stateCond.wait_for(lk, std::chrono::microseconds(static_cast<int64_t>(n) * 1000000 / core.sampleRate),
+                              [&] { return core.exit; });
     }
     return b.size;
 }

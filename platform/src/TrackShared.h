@@ -7,6 +7,7 @@
 #include <cstdint>
 #include <memory>
 #include <mutex>
+#include <string>
 #include <vector>
 
 #include <korvo/platform/Routes.h>
@@ -25,6 +26,7 @@ struct TrackCore {
     void* user = nullptr;
     uint32_t sampleRate = 0;
     std::unique_ptr<OutputRoute> route;
+    std::string routeText;
 
     // Guarded by TrackControl::stateMutex.
     bool active = false;  // started and not stopped

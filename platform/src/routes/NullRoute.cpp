@@ -26,6 +26,7 @@ public:
         return static_cast<ssize_t>(n);
     }
     void stop() override { mPacing.stop(); }
+    std::string failure() const override { return {}; }
 
 private:
     CapturePacing mPacing;
@@ -39,8 +40,12 @@ public:
         mPacing.start(sampleRate);
         return 0;
     }
-    void write(const int16_t* /*samples*/, size_t count) override { mPacing.next(count); }
+    int write(const int16_t* /*samples*/, size_t count) override {
+        mPacing.next(count);
+        return 0;
+    }
     void stop() override { mPacing.stop(); }
+    std::string failure() const override { return {}; }
 
 private:
     OutputPacing mPacing;

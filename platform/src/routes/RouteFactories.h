@@ -18,5 +18,11 @@ std::unique_ptr<OutputRoute> makeSimOutputRoute(const std::string& room, std::st
 std::unique_ptr<CaptureRoute> makeCardCaptureRoute(const std::string& device, std::string* error);
 std::unique_ptr<OutputRoute> makeCardOutputRoute(const std::string& device, std::string* error);
 
+// Whether a route could be used now, leaving nothing behind; false with the cause.
+bool checkWavCapture(const std::string& path, std::string* reason);
+bool checkWavOutput(const std::string& path, std::string* reason);
+bool checkSimRoute(const std::string& room, bool speaker, std::string* reason);
+bool checkCardRoute(const std::string& device, bool input, std::string* reason);
+
 }  // namespace platform
 }  // namespace korvo

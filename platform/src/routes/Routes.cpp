@@ -92,6 +92,29 @@ std::unique_ptr<OutputRoute> makeOutputRoute(const std::string& route, std::stri
     return nullptr;
 }
 
+namespace {
+
+bool checkRoute(const std::string& route, bool speaker, std::string* reason) {
+    RouteText t;
+    if (!parse(route, &t, reason)) return false;
+    std::string cause;
+    bool ok = true;
+    switch (t.kind) {
+        case RouteKind::Null: break;
+        case RouteKind::Wav: ok = speaker ? checkWavOutput(t.arg, &cause) : checkWavCapture(t.arg, &cause); break;
+        case RouteKind::Sim: ok = checkSimRoute(t.arg, speaker, &cause); break;
+        case RouteKind::Card: ok = checkCardRoute(t.arg, !speaker, &cause); break;
+    }
+    if (!ok && reason) *reason = route + ": " + cause;
+    return ok;
+}
+
+}  // namespace
+
+bool checkCaptureRoute(const std::string& route, std::string* reason) { return checkRoute(route, false, reason); }
+
+bool checkOutputRoute(const std::string& route, std::string* reason) { return checkRoute(route, true, reason); }
+
 bool validateRoute(const std::string& route, std::string* error) {
     RouteText t;
     if (!parse(route, &t, error)) return false;

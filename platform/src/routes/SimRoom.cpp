@@ -4,6 +4,7 @@
 #include <utils/Errors.h>
 
 #include <algorithm>
+#include <atomic>
 #include <cmath>
 #include <cstdint>
 
@@ -39,6 +40,28 @@ bool checkRate(uint32_t sampleRate, const char* what) {
     return false;
 }
 
+// How often a member looks whether its room is still there.
+constexpr int64_t kPresenceCheckSamples = sim::kRoomRate / 4;
+
+// A room removed under its members (by hand, or by a cleaner) is a device that went away.
+class Presence {
+public:
+    // False once the room has gone; looks at most every quarter second of the timeline.
+    bool ok(const RoomMembership& room, int64_t position) {
+        if (mGone.load(std::memory_order_relaxed)) return false;
+        if (position - mLastCheck < kPresenceCheckSamples && mLastCheck != 0) return true;
+        mLastCheck = position;
+        if (room.stillThere()) return true;
+        mGone.store(true, std::memory_order_relaxed);
+        return false;
+    }
+    std::string failure() const { return mGone.load(std::memory_order_relaxed) ? "the room was removed" : ""; }
+
+private:
+    int64_t mLastCheck = 0;
+    std::atomic<bool> mGone{false};
+};
+
 class SimOutputRoute : public OutputRoute {
 public:
     explicit SimOutputRoute(std::unique_ptr<RoomMembership> room)
@@ -53,7 +76,8 @@ public:
     }
 
     // Real-time: no allocation; blocks only to pace the caller, until stop().
-    void write(const int16_t* samples, size_t count) override {
+    int write(const int16_t* samples, size_t count) override {
+        if (!mPresence.ok(*mRoom, sim::timelineNow())) return android::DEAD_OBJECT;
         while (count > 0 && !mWaiter.stopped()) {
             const size_t n = std::min(count, kChunk);
             const int64_t now = sim::timelineNow();
@@ -63,16 +87,19 @@ public:
             samples += n;
             count -= n;
             // Ready for more when exactly the latency is left queued.
-            if (!mWaiter.waitFor(mNext - sim::kLatencySamples)) return;
+            if (!mWaiter.waitFor(mNext - sim::kLatencySamples)) break;
         }
+        return android::OK;
     }
 
     void stop() override { mWaiter.stop(); }
+    std::string failure() const override { return mPresence.failure(); }
 
 private:
     std::unique_ptr<RoomMembership> mRoom;
     int64_t mNext;  // timeline position of the next sample to write
     sim::TimelineWaiter mWaiter;
+    Presence mPresence;
 };
 
 class SimCaptureRoute : public CaptureRoute {
@@ -94,6 +121,7 @@ public:
     ssize_t read(int16_t* out, size_t count) override {
         if (!mOpened) return android::NO_INIT;
         const int64_t now = sim::timelineNow();
+        if (!mPresence.ok(*mRoom, now)) return android::DEAD_OBJECT;
         if (now - mReadPos > kMaxBacklog) mReadPos = now;
         size_t n = count;
         if (!mWaiter.waitFor(mReadPos + int64_t(count))) {
@@ -110,6 +138,7 @@ public:
     }
 
     void stop() override { mWaiter.stop(); }
+    std::string failure() const override { return mPresence.failure(); }
 
 private:
     // Mixes every speaker over [position, position + count), count <= kChunk.
@@ -135,9 +164,16 @@ private:
     int64_t mReadPos = 0;  // timeline position of the next sample to deliver
     bool mOpened = false;
     sim::TimelineWaiter mWaiter;
+    Presence mPresence;
 };
 
 }  // namespace
+
+bool checkSimRoute(const std::string& room, bool speaker, std::string* reason) {
+    if (!speaker && !sim::micSettingsFromEnv(reason)) return false;
+    return RoomMembership::check(room, speaker ? RoomMembership::Role::Speaker : RoomMembership::Role::Microphone,
+                                 reason);
+}
 
 std::unique_ptr<CaptureRoute> makeSimCaptureRoute(const std::string& room, std::string* error) {
     if (!sim::validateRoomName(room, error)) return nullptr;

@@ -82,11 +82,9 @@ bool validateRoomName(const std::string& room, std::string* error) {
     return ok;
 }
 
-std::string roomObjectPrefix() {
-    return "korvo-room-" + std::to_string(unsigned(geteuid())) + "-";
-}
+std::string roomFolder() { return "/dev/shm/korvo-" + std::to_string(unsigned(geteuid())); }
 
-std::string roomObjectName(const std::string& room) { return "/" + roomObjectPrefix() + room; }
+std::string roomPath(const std::string& room) { return roomFolder() + "/" + room; }
 
 std::optional<MicSettings> micSettingsFromEnv(std::string* error) {
     MicSettings s;

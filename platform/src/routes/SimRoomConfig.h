@@ -20,10 +20,11 @@ constexpr size_t kMaxRoomNameLength = 64;
 // ROOM is 1..64 characters of [A-Za-z0-9._-]; false with a one-line reason otherwise.
 bool validateRoomName(const std::string& room, std::string* error);
 
-// Prefix of every room object of this user in the shared-memory namespace (no leading '/').
-std::string roomObjectPrefix();
-// shm_open name of a room ("/korvo-room-<uid>-<ROOM>").
-std::string roomObjectName(const std::string& room);
+// The folder of this user's rooms: /dev/shm/korvo-<uid>, private to the user (0700), so
+// that no other user can read, join or take a room name.
+std::string roomFolder();
+// The file of a room in that folder.
+std::string roomPath(const std::string& room);
 
 struct MicSettings {
     double gainDb = 0.0;

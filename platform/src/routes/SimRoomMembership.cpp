@@ -22,9 +22,7 @@ namespace sim {
 
 namespace {
 
-// Where glibc keeps shm_open objects; only used to find abandoned rooms.
-constexpr const char* kShmDir = "/dev/shm";
-// A joiner whose room keeps being unlinked under it gives up after this many tries.
+// A joiner whose room keeps being removed under it gives up after this many tries.
 constexpr int kJoinAttempts = 50;
 
 std::string errnoText(int err) { return std::strerror(err); }
@@ -36,16 +34,39 @@ void lockFile(int fd) {
 
 void unlockFile(int fd) { flock(fd, LOCK_UN); }
 
-// True while `name` still refers to the object open on fd.
-bool stillNamed(int fd, const std::string& name) {
-    const int other = shm_open(name.c_str(), O_RDWR | O_CLOEXEC, 0);
-    if (other < 0) return false;
+// True while `path` still refers to the file open on fd.
+bool stillNamed(int fd, const std::string& path) {
     struct stat a{}, b{};
-    const bool same = fstat(fd, &a) == 0 && fstat(other, &b) == 0 && a.st_dev == b.st_dev &&
-                      a.st_ino == b.st_ino;
-    close(other);
-    return same;
+    return fstat(fd, &a) == 0 && stat(path.c_str(), &b) == 0 && a.st_dev == b.st_dev && a.st_ino == b.st_ino;
 }
+
+// Makes sure the user's room folder exists and is private to the user; false with a
+// reason when it cannot be used (another user made it first, or it is not private).
+bool privateFolder(std::string* error, bool create) {
+    const std::string dir = roomFolder();
+    if (create && mkdir(dir.c_str(), 0700) != 0 && errno != EEXIST) {
+        if (error) *error = "cannot make the room folder " + dir + ": " + errnoText(errno);
+        return false;
+    }
+    struct stat st{};
+    if (lstat(dir.c_str(), &st) != 0) {
+        if (errno == ENOENT && !create) return true;
+        if (error) *error = "cannot use the room folder " + dir + ": " + errnoText(errno);
+        return false;
+    }
+    if (!S_ISDIR(st.st_mode) || st.st_uid != geteuid()) {
+        if (error) *error = "the room folder " + dir + " belongs to another user";
+        return false;
+    }
+    if ((st.st_mode & 0077) != 0) {
+        if (error) *error = "the room folder " + dir + " is open to other users";
+        return false;
+    }
+    return true;
+}
+
+// Removes the room folder once its last room has gone (fails harmlessly otherwise).
+void dropFolderIfEmpty() { rmdir(roomFolder().c_str()); }
 
 RoomLayout* mapLayout(int fd) {
     void* p = mmap(nullptr, sizeof(RoomLayout), PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0);
@@ -87,14 +108,14 @@ int forgetDeparted(RoomLayout& layout) {
     return live;
 }
 
-// Unlinks the room `name` if nobody uses it any more. Never waits: a room whose
+// Removes the room at `path` if nobody uses it any more. Never waits: a room whose
 // lock is taken is in use.
-void reclaimIfAbandoned(const std::string& name) {
-    const int fd = shm_open(name.c_str(), O_RDWR | O_CLOEXEC, 0);
+void reclaimIfAbandoned(const std::string& path) {
+    const int fd = open(path.c_str(), O_RDWR | O_CLOEXEC | O_NOFOLLOW);
     if (fd < 0) return;
     if (flock(fd, LOCK_EX | LOCK_NB) == 0) {
         struct stat st{};
-        if (fstat(fd, &st) == 0 && st.st_uid == geteuid() && stillNamed(fd, name)) {
+        if (fstat(fd, &st) == 0 && stillNamed(fd, path)) {
             bool abandoned = false;
             if (st.st_size == 0) {
                 abandoned = true;  // its creator died before setting it up, or will retry
@@ -105,21 +126,19 @@ void reclaimIfAbandoned(const std::string& name) {
                     unmapLayout(layout);
                 }
             }
-            if (abandoned) shm_unlink(name.c_str());
+            if (abandoned) unlink(path.c_str());
         }
     }
     close(fd);  // also drops the lock
 }
 
 void reclaimAbandonedRooms(const std::string& except) {
-    DIR* dir = opendir(kShmDir);
+    DIR* dir = opendir(roomFolder().c_str());
     if (!dir) return;
-    const std::string prefix = roomObjectPrefix();
     while (const dirent* entry = readdir(dir)) {
-        const std::string name = std::string("/") + entry->d_name;
-        if (name != except && std::strncmp(entry->d_name, prefix.c_str(), prefix.size()) == 0) {
-            reclaimIfAbandoned(name);
-        }
+        if (entry->d_name[0] == '.') continue;
+        const std::string path = roomFolder() + "/" + entry->d_name;
+        if (path != except) reclaimIfAbandoned(path);
     }
     closedir(dir);
 }
@@ -175,13 +194,17 @@ std::unique_ptr<RoomMembership> RoomMembership::join(const std::string& room, Ro
         return std::unique_ptr<RoomMembership>();
     };
     if (!validateRoomName(room, error)) return nullptr;
-    const std::string name = roomObjectName(room);
+    const std::string name = roomPath(room);
     const uint64_t self = processIdentity(getpid());
     if (self == 0) return fail("sim room '" + room + "': cannot identify this process");
+    std::string folderError;
+    if (!privateFolder(&folderError, false)) return fail(folderError);
     reclaimAbandonedRooms(name);
 
     for (int attempt = 0; attempt < kJoinAttempts; ++attempt) {
-        const int fd = shm_open(name.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600);
+        if (!privateFolder(&folderError, true)) return fail(folderError);
+        const int fd = open(name.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
+        if (fd < 0 && errno == ENOENT) continue;  // the folder went with its last room meanwhile
         if (fd < 0) return fail("cannot open sim room '" + room + "': " + errnoText(errno));
         lockFile(fd);
         // Closing fd drops the lock on every path below.
@@ -269,11 +292,47 @@ RoomMembership::~RoomMembership() {
     lockFile(mFd);
     if (mMember >= 0) mLayout->header.members[mMember].store(0, std::memory_order_release);
     if (mSlot >= 0) mLayout->slots[mSlot].owner.store(0, std::memory_order_release);
-    if (forgetDeparted(*mLayout) == 0 && stillNamed(mFd, mObjectName)) {
-        shm_unlink(mObjectName.c_str());
-    }
+    const bool last = forgetDeparted(*mLayout) == 0 && stillNamed(mFd, mObjectName);
+    if (last) unlink(mObjectName.c_str());
     unmapLayout(mLayout);
     close(mFd);  // drops the lock
+    if (last) dropFolderIfEmpty();
+}
+
+bool RoomMembership::stillThere() const { return stillNamed(mFd, mObjectName); }
+
+bool RoomMembership::check(const std::string& room, Role role, std::string* error) {
+    if (!validateRoomName(room, error) || !privateFolder(error, false)) return false;
+    const std::string path = roomPath(room);
+    const int fd = open(path.c_str(), O_RDWR | O_CLOEXEC | O_NOFOLLOW);
+    if (fd < 0) {
+        if (errno == ENOENT) return true;  // a new room: joining creates it
+        if (error) *error = "cannot open sim room '" + room + "': " + errnoText(errno);
+        return false;
+    }
+    lockFile(fd);
+    std::string why;
+    struct stat st{};
+    RoomLayout* layout = nullptr;
+    if (fstat(fd, &st) == 0 && size_t(st.st_size) == sizeof(RoomLayout) && (layout = mapLayout(fd)) != nullptr) {
+        if (!compatible(layout->header)) {
+            if (layout->header.magic.load(std::memory_order_acquire) != 0) why = "sim room '" + room + "' was made by an incompatible build";
+        } else {
+            forgetDeparted(*layout);
+            int members = 0, speakers = 0;
+            for (const auto& m : layout->header.members) members += m.load(std::memory_order_acquire) != 0;
+            for (const auto& slot : layout->slots) speakers += slot.owner.load(std::memory_order_acquire) != 0;
+            if (members >= kMaxMembers || (role == Role::Speaker && speakers >= kSpeakerSlots)) {
+                why = "sim room '" + room + "' is full";
+            }
+        }
+        unmapLayout(layout);
+    } else if (st.st_size != 0) {
+        why = "sim room '" + room + "' was made by an incompatible build";
+    }
+    close(fd);
+    if (!why.empty() && error) *error = why;
+    return why.empty();
 }
 
 }  // namespace sim

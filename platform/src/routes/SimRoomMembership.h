@@ -1,14 +1,15 @@
 // A route's place in a room: the mapped shared memory, its member entry and,
 // for a speaker, its slot.
 //
-// Rooms are POSIX shared-memory objects, one per user and room name, mode 0600.
-// Joining and leaving take flock() on the object: the kernel drops that lock
-// when a process dies, so a crash never wedges a room. Under the lock a joiner
-// checks that the name still refers to the object it opened (a leaver may have
-// unlinked it meanwhile), sets the room up if it is new, forgets members whose
-// process is gone and takes free entries; the last leaver unlinks the room.
-// Joining also unlinks rooms of this user that every member has left or died
-// in. Audio itself never takes the lock (see SimRoomSlot.h).
+// Rooms are files in shared memory, in a folder private to their user
+// (/dev/shm/korvo-<uid>, 0700): no other user can read, join or take a name there.
+// Joining and leaving take flock() on the room: the kernel drops that lock when a
+// process dies, so a crash never wedges a room. Under the lock a joiner checks that
+// the name still refers to the file it opened (a leaver may have removed it
+// meanwhile), sets the room up if it is new, forgets members whose process is gone
+// and takes free entries; the last leaver removes the room, and the folder with its
+// last room. Joining also removes rooms of this user that every member has left or
+// died in. Audio itself never takes the lock (see SimRoomSlot.h).
 #pragma once
 #include <cstdint>
 #include <memory>
@@ -28,6 +29,10 @@ public:
     static std::unique_ptr<RoomMembership> join(const std::string& room, Role role,
                                                 std::string* error);
     ~RoomMembership();  // leaves the room
+    // Whether the room could be joined now, without joining it or leaving anything behind.
+    static bool check(const std::string& room, Role role, std::string* error);
+    // False once the room's file has been removed or replaced under this member.
+    bool stillThere() const;
 
     RoomMembership(const RoomMembership&) = delete;
     RoomMembership& operator=(const RoomMembership&) = delete;

@@ -12,6 +12,7 @@
 #include <cstdarg>
 #include <cstdio>
 #include <mutex>
+#include <vector>
 
 #include "routes/RouteFactories.h"
 
@@ -206,7 +207,8 @@ public:
             if (err != paNoError && err != paInputOverflowed) {  // a lost block is no failure
                 __android_log_print(ANDROID_LOG_ERROR, kTag, "sound card read failed: %s",
                                     Pa_GetErrorText(err));
-                return done > 0 ? ssize_t(done) : ssize_t(android::UNKNOWN_ERROR);
+                setFailure(std::string("the sound card failed: ") + Pa_GetErrorText(err));
+                return ssize_t(android::UNKNOWN_ERROR);
             }
             done += n;
         }
@@ -214,11 +216,21 @@ public:
     }
 
     void stop() override { mStopped.store(true, std::memory_order_relaxed); }
+    std::string failure() const override {
+        std::lock_guard<std::mutex> lock(mFailureLock);
+        return mFailure;
+    }
 
 private:
+    void setFailure(const std::string& why) {
+        std::lock_guard<std::mutex> lock(mFailureLock);
+        mFailure = why;
+    }
     std::unique_ptr<PaSession> mSession;  // outlives the stream
     CardStream mStream;
     std::atomic<bool> mStopped{false};
+    mutable std::mutex mFailureLock;
+    std::string mFailure;
 };
 
 class CardOutputRoute : public OutputRoute {
@@ -231,8 +243,8 @@ public:
         return mStream.open(double(sampleRate)) ? android::OK : android::NO_INIT;
     }
 
-    void write(const int16_t* samples, size_t count) override {
-        if (!mStream.stream()) return;
+    int write(const int16_t* samples, size_t count) override {
+        if (!mStream.stream()) return android::NO_INIT;
         size_t done = 0;
         while (done < count && !mStopped.load(std::memory_order_relaxed)) {
             const unsigned long n = std::min<unsigned long>(count - done, kPieceFrames);
@@ -240,18 +252,27 @@ public:
             if (err != paNoError && err != paOutputUnderflowed) {  // a late block is no failure
                 __android_log_print(ANDROID_LOG_ERROR, kTag, "sound card write failed: %s",
                                     Pa_GetErrorText(err));
-                return;
+                std::lock_guard<std::mutex> lock(mFailureLock);
+                mFailure = std::string("the sound card failed: ") + Pa_GetErrorText(err);
+                return android::UNKNOWN_ERROR;
             }
             done += n;
         }
+        return android::OK;
     }
 
     void stop() override { mStopped.store(true, std::memory_order_relaxed); }
+    std::string failure() const override {
+        std::lock_guard<std::mutex> lock(mFailureLock);
+        return mFailure;
+    }
 
 private:
     std::unique_ptr<PaSession> mSession;
     CardStream mStream;
     std::atomic<bool> mStopped{false};
+    mutable std::mutex mFailureLock;
+    std::string mFailure;
 };
 
 // Starts PortAudio and finds the device; null with a one-line reason on failure.
@@ -284,6 +305,40 @@ std::unique_ptr<PaSession> prepare(const std::string& device, bool input, PaDevi
 }
 
 }  // namespace
+
+bool checkCardRoute(const std::string& device, bool input, std::string* reason) {
+    PaDeviceIndex index = paNoDevice;
+    return prepare(device, input, &index, reason) != nullptr;
+}
+
+bool listCardDevices(std::vector<CardDevice>* devices, std::string* error) {
+    PaSession session;
+    if (session.status() != paNoError) {
+        if (error) *error = std::string("PortAudio cannot start: ") + Pa_GetErrorText(session.status());
+        return false;
+    }
+    std::lock_guard<std::mutex> lock(paMutex());
+    const PaDeviceIndex count = Pa_GetDeviceCount();
+    if (count < 0) {
+        if (error) *error = std::string("PortAudio cannot list devices: ") + Pa_GetErrorText(count);
+        return false;
+    }
+    devices->clear();
+    for (PaDeviceIndex i = 0; i < count; ++i) {
+        const PaDeviceInfo* info = Pa_GetDeviceInfo(i);
+        if (!info) continue;
+        CardDevice d;
+        d.index = i;
+        d.name = info->name ? info->name : "";
+        d.inputChannels = info->maxInputChannels;
+        d.outputChannels = info->maxOutputChannels;
+        d.defaultRate = info->defaultSampleRate;
+        d.defaultInput = i == Pa_GetDefaultInputDevice();
+        d.defaultOutput = i == Pa_GetDefaultOutputDevice();
+        devices->push_back(d);
+    }
+    return true;
+}
 
 std::unique_ptr<CaptureRoute> makeCardCaptureRoute(const std::string& device, std::string* error) {
     PaDeviceIndex index = paNoDevice;

@@ -2,8 +2,13 @@
 // sample written to the loudspeaker. Both at real-time pace.
 #include <sndfile.h>
 
+#include <sys/stat.h>
+#include <unistd.h>
+
 #include <algorithm>
+#include <cerrno>
 #include <cstring>
+#include <mutex>
 #include <vector>
 
 #include <log/log.h>
@@ -65,6 +70,7 @@ public:
     }
 
     void stop() override { mPacing.stop(); }
+    std::string failure() const override { return {}; }
 
 private:
     const std::string mPath;
@@ -119,15 +125,25 @@ public:
         return 0;
     }
 
-    void write(const int16_t* samples, size_t count) override {
+    int write(const int16_t* samples, size_t count) override {
+        int rc = 0;
         if (mFile && count > 0) {
-            sf_writef_short(mFile, samples, static_cast<sf_count_t>(count));
+            if (sf_writef_short(mFile, samples, static_cast<sf_count_t>(count)) != static_cast<sf_count_t>(count)) {
+                std::lock_guard<std::mutex> lock(mFailureLock);
+                mFailure = std::string("cannot write: ") + sf_strerror(mFile);
+                rc = android::UNKNOWN_ERROR;
+            }
             mWritten += count;
         }
         mPacing.next(count);
+        return rc;
     }
 
     void stop() override { mPacing.stop(); }
+    std::string failure() const override {
+        std::lock_guard<std::mutex> lock(mFailureLock);
+        return mFailure;
+    }
 
 private:
     const std::string mPath;
@@ -135,9 +151,39 @@ private:
     uint32_t mRate;
     uint64_t mWritten = 0;
     OutputPacing mPacing;
+    mutable std::mutex mFailureLock;
+    std::string mFailure;
 };
 
 }  // namespace
+
+bool checkWavCapture(const std::string& path, std::string* reason) {
+    std::string error;
+    auto route = makeWavCaptureRoute(path, &error);
+    if (!route && reason) *reason = error;
+    return route != nullptr;
+}
+
+bool checkWavOutput(const std::string& path, std::string* reason) {
+    struct stat st{};
+    const bool existed = stat(path.c_str(), &st) == 0;
+    if (existed && S_ISDIR(st.st_mode)) {
+        if (reason) *reason = "cannot write: Is a directory";
+        return false;
+    }
+    SNDFILE* file = createWav(path, kDefaultRate);
+    if (!file) {
+        if (reason) *reason = std::string("cannot write: ") + std::strerror(errno);
+        return false;
+    }
+    const int16_t probe[1] = {0};
+    const bool ok = sf_writef_short(file, probe, 1) == 1 && sf_error(file) == SF_ERR_NO_ERROR;
+    const std::string why = sf_strerror(file);
+    sf_close(file);
+    if (!existed) unlink(path.c_str());
+    if (!ok && reason) *reason = "cannot write: " + why;
+    return ok;
+}
 
 std::unique_ptr<CaptureRoute> makeWavCaptureRoute(const std::string& path, std::string* error) {
     SF_INFO info{};
