@@ -77,6 +77,8 @@ bool ChildProcess::start(const std::string& path, const std::vector<std::string>
     if (pid == 0) {
         prctl(PR_SET_PDEATHSIG, SIGTERM);
         if (getppid() != parent) _exit(127);  // the parent is already gone
+        if (options.ownGroup) setpgid(0, 0);
+        if (options.userId >= 0 && (setgid(gid_t(options.userId)) != 0 || setuid(uid_t(options.userId)) != 0)) _exit(126);
         dup2(pipes[0][1], STDOUT_FILENO);     // dup2 clears close-on-exec on the copy
         if (count == 2) dup2(pipes[1][1], STDERR_FILENO);
         if (options.nullStdin) {

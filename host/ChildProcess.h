@@ -19,6 +19,8 @@ public:
     struct Options {
         bool captureStderr = false;  // else stderr is shared with the parent
         bool nullStdin = false;      // else stdin is shared with the parent
+        bool ownGroup = false;       // a process group of its own: the terminal's Ctrl-C reaches only the parent
+        int userId = -1;             // run as this user (and its group), when the parent may
     };
 
     ChildProcess() = default;

@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cstdarg>
 #include <cmath>
 #include <map>
 #include <string>
@@ -20,6 +21,7 @@
 #include "host/CodePlan.h"
 #include "host/Environment.h"
 #include "host/Interrupt.h"
+#include "host/JsonEvent.h"
 #include "host/Options.h"
 #include "host/Output.h"
 #include "host/Protocol.h"
@@ -36,6 +38,11 @@ struct DemoOptions {
     int toneMs = 300;
     int timeoutMs = 8000;
 };
+
+// The noisiest room a microphone takes is 0 dBFS of noise, the tone's RMS lies about 9.9 dB below.
+constexpr double kMinSnr = -9.0;
+// A device that has not printed "ready" after this long is taken as stuck.
+constexpr int64_t kStartupMs = 10000;
 
 // RMS of the tone engine's sine (peak 14744 of 32768) in dBFS, 0 dBFS being an RMS of 32768.
 const double kToneDbfs = 20.0 * std::log10(14744.0 / 32768.0 / std::sqrt(2.0));
@@ -60,6 +67,12 @@ std::string uniqueRoomName() {
 enum Who { kListener = 0, kSpeaker = 1 };
 const char* const kWhoName[2] = {"listener", "speaker"};
 
+// What happened in one round, from both devices' lines.
+struct Round {
+    int said = -1, heard = -1, answered = -1, answerHeard = -1;  // codes
+    long long saidAt = -1, answeredAt = -1;
+};
+
 class DemoRun {
 public:
     DemoRun(const CommonOptions& common, const DemoOptions& o) : mCommon(common), mOpt(o) {}
@@ -72,6 +85,15 @@ public:
         mMic = mCommon.mic.empty() ? "sim:" + mRoom : mCommon.mic;
         mSpeaker = mCommon.speaker.empty() ? "sim:" + mRoom : mCommon.speaker;
         const bool freshRoom = mCommon.mic.empty() || mCommon.speaker.empty();
+        std::string why;
+        if (!korvo::platform::checkCaptureRoute(mMic, &why)) {
+            errf("microphone %s", why.c_str());
+            return 2;
+        }
+        if (!korvo::platform::checkOutputRoute(mSpeaker, &why)) {
+            errf("speaker %s", why.c_str());
+            return 2;
+        }
         mStart = monotonicMs();
         std::string noise = "no noise";
         if (mOpt.snrGiven) {
@@ -82,10 +104,10 @@ public:
             noise = text;
         }
         const std::string where = freshRoom ? "in room " + mRoom : "on mic " + mMic + ", speaker " + mSpeaker;
-        outf("demo %s: %d round%s, acknowledgement %s, tones of %d ms, %s\n", where.c_str(), mOpt.rounds,
-             mOpt.rounds == 1 ? "" : "s", mOpt.noAck ? "off" : "on", mOpt.toneMs, noise.c_str());
+        infof("demo %s: %s, acknowledgement %s, tones of %d ms, %s\n", where.c_str(), plural(mOpt.rounds, "round").c_str(),
+              mOpt.noAck ? "off" : "on", mOpt.toneMs, noise.c_str());
 
-        bool started = startDevice(kListener);
+        const bool started = startDevice(kListener);
         if (started) pump();
         int status[2] = {-1, -1};
         finish(status);
@@ -111,31 +133,39 @@ private:
         if (mOpt.snrGiven) snprintf(level, sizeof level, "%.2f", mNoiseDbfs);
         env.emplace_back("KORVO_SIM_NOISE", level);
         std::string error;
-        if (!mChild[who].start(selfExecutable(), args, env, ChildProcess::Options{}, &error)) {
+        ChildProcess::Options options;
+        options.ownGroup = true;  // Ctrl-C reaches the demo, which stops its devices
+        if (!mChild[who].start(selfExecutable(), args, env, options, &error)) {
             errf("cannot start the %s: %s", kWhoName[who], error.c_str());
             return false;
         }
         mOpen[who] = true;
+        mQuietUntil[who] = monotonicMs() + kStartupMs;
         return true;
     }
 
-    // Reads both devices' lines until both have closed their output, or the demo is
-    // stopped by Ctrl-C or by its own watchdog.
+    // The longest a working device stays silent: its peer's hearing (one timeout), a tone,
+    // and its own hearing (another timeout).
+    int64_t silenceAllowedMs() const { return mOpt.toneMs + 2 * int64_t(mOpt.timeoutMs); }
+
+    // Reads both devices' lines until both have closed their output, Ctrl-C, or a device
+    // that stopped responding.
     void pump() {
-        int64_t watchdog = mStart + 30000 + int64_t(mOpt.rounds) * (2 * mOpt.timeoutMs + mOpt.toneMs + 1000);
-        bool stopping = false;
-        int64_t killAt = 0;
         while (mOpen[kListener] || mOpen[kSpeaker]) {
-            if (!stopping && (interrupted() || monotonicMs() >= watchdog)) {
-                if (!interrupted()) errf("the demo took too long; stopping the devices");
-                stopping = true;
-                mAborted = true;
-                killAt = monotonicMs() + 10000;
-                for (ChildProcess& c : mChild) c.sendSignal(SIGTERM);
+            if (interrupted()) {
+                stopDevices();
+                break;
             }
-            if (stopping && monotonicMs() >= killAt) {
-                for (ChildProcess& c : mChild) c.sendSignal(SIGKILL);
-                killAt = INT64_MAX;
+            for (int w = 0; w < 2 && mStuck.empty(); ++w) {
+                if (mOpen[w] && monotonicMs() >= mQuietUntil[w]) {
+                    mStuck = kWhoName[w];
+                    errf("the %s stopped responding (no word for %lld ms)", kWhoName[w],
+                         static_cast<long long>(monotonicMs() - mQuietUntil[w] + silenceAllowedMs()));
+                }
+            }
+            if (!mStuck.empty()) {
+                stopDevices();
+                break;
             }
             pollfd fds[2];
             int who[2];
@@ -158,47 +188,72 @@ private:
         }
     }
 
+    // A stopped (or frozen) process does not act on SIGTERM: the demo kills its devices.
+    void stopDevices() {
+        for (ChildProcess& c : mChild) c.sendSignal(interrupted() ? SIGTERM : SIGKILL);
+        mAborted = true;
+    }
+
     void onLine(Who who, const std::string& line) {
         ProtocolLine p;
         if (!p.parse(line)) return;  // not a protocol line: the device's business
-        long long t = p.get("t", monotonicMs());
-        int code = static_cast<int>(p.get("code"));
-        int round = static_cast<int>(p.get("round"));
-        char text[160];
+        mQuietUntil[who] = monotonicMs() + silenceAllowedMs();
+        const long long t = p.get("t", monotonicMs());
+        const int code = static_cast<int>(p.get("code"));
+        const int round = static_cast<int>(p.get("round"));
+        Round& r = mRounds[round];
         if (p.event == "ready") {
             mReady[who] = true;
-            snprintf(text, sizeof text, "ready");
-            show(t, who, text);
-            if (who == kListener && !stoppingOrStarted()) startDevice(kSpeaker);
+            show(t, who, "ready");
+            if (who == kListener && !mAborted && !mChild[kSpeaker].running()) startDevice(kSpeaker);
         } else if (p.event == "said") {
-            mSaidAt[who][round] = t;
-            snprintf(text, sizeof text, "says  code %2d (%5d Hz)", code, codeHz(code));
-            show(t, who, text);
+            (who == kSpeaker ? r.said : r.answered) = code;
+            (who == kSpeaker ? r.saidAt : r.answeredAt) = t;
+            event(JsonEvent("said").add("device", kWhoName[who]).add("round", round).add("code", code), t, who,
+                  "says  code %2d (%5d Hz)", code, codeHz(code));
         } else if (p.event == "heard") {
-            Who peer = who == kListener ? kSpeaker : kListener;
-            long long latency = p.get("waited");
-            auto said = mSaidAt[peer].find(round);
-            if (said != mSaidAt[peer].end()) latency = t - said->second;
-            snprintf(text, sizeof text, "hears code %2d (%5d Hz)  latency %lld ms", code, codeHz(code), latency);
-            show(t, who, text);
-            // The exchange is complete with the last hearing of its round.
-            Who last = mOpt.noAck ? kListener : kSpeaker;
-            auto started = mSaidAt[kSpeaker].find(round);
-            if (who == last && started != mSaidAt[kSpeaker].end()) mLatencies.push_back(t - started->second);
+            const long long toneAt = who == kListener ? r.saidAt : r.answeredAt;
+            const long long oneWay = toneAt >= 0 ? t - toneAt : p.get("waited");
+            (who == kListener ? r.heard : r.answerHeard) = code;
+            event(JsonEvent("heard").add("device", kWhoName[who]).add("round", round).add("code", code).add("one_way_ms", oneWay),
+                  t, who, "hears code %2d (%5d Hz), one way %lld ms", code, codeHz(code), oneWay);
+            exchangeDone(round, t);
         } else if (p.event == "timeout") {
-            snprintf(text, sizeof text, "did not hear code %d (%d Hz) within %lld ms", code, codeHz(code),
-                     p.get("waited"));
-            show(t, who, text);
+            show(t, who, "did not hear code " + std::to_string(code) + " (" + std::to_string(codeHz(code)) + " Hz) within " +
+                             std::to_string(p.get("waited")) + " ms");
         } else if (p.event == "done") {
-            snprintf(text, sizeof text, "finished, %lld of %lld rounds", p.get("completed"), p.get("rounds"));
-            show(t, who, text);
+            show(t, who, "finished, " + std::to_string(p.get("completed")) + " of " + plural(p.get("rounds"), "round"));
         }
     }
 
-    bool stoppingOrStarted() const { return mAborted || mChild[kSpeaker].running() || mOpen[kSpeaker]; }
+    // An exchange counts once both devices did their part of the same round with the same codes.
+    void exchangeDone(int round, long long t) {
+        const Round& r = mRounds[round];
+        const bool heard = r.said >= 0 && r.heard == r.said;
+        const bool complete = mOpt.noAck ? heard : heard && r.answered == r.said + 1 && r.answerHeard == r.answered;
+        if (!complete || mCounted.count(round)) return;
+        mCounted.insert({round, true});
+        const long long roundTrip = t - r.saidAt;
+        mLatencies.push_back(roundTrip);
+        JsonEvent e("exchange");
+        e.add("round", round).add("code", r.said).add("round_trip_ms", roundTrip);
+        if (!mOpt.noAck) e.add("answer", r.answered);
+        event(e, t, kSpeaker, mOpt.noAck ? "exchange %d complete, code said to code heard in %lld ms"
+                                         : "exchange %d complete, round trip %lld ms (code said to its answer heard)",
+              round, roundTrip);
+    }
 
-    void show(long long t, Who who, const char* text) {
-        outf("%8.3f s  %-8s  %s\n", (t - mStart) / 1000.0, kWhoName[who], text);
+    void event(const JsonEvent& e, long long t, Who who, const char* fmt, ...) __attribute__((format(printf, 5, 6))) {
+        char text[200];
+        va_list ap;
+        va_start(ap, fmt);
+        vsnprintf(text, sizeof text, fmt, ap);
+        va_end(ap);
+        progressf(e, "%8.3f s  %-8s  %s\n", (t - mStart) / 1000.0, kWhoName[who], text);
+    }
+
+    void show(long long t, Who who, const std::string& text) {
+        infof("%8.3f s  %-8s  %s\n", (t - mStart) / 1000.0, kWhoName[who], text.c_str());
     }
 
     void finish(int status[2]) {
@@ -221,29 +276,43 @@ private:
             return;
         }
         probe.reset();
-        outf("room %s removed\n", mRoom.c_str());
+        infof("room %s removed\n", mRoom.c_str());
     }
 
     int summarize(bool started, const int status[2]) {
-        int completed = static_cast<int>(mLatencies.size());
+        const int completed = static_cast<int>(mLatencies.size());
+        JsonEvent summary("summary");
+        summary.add("rounds", mOpt.rounds).add("completed", completed);
         if (completed > 0) {
-            std::vector<int64_t> sorted = mLatencies;
+            std::vector<long long> sorted = mLatencies;
             std::sort(sorted.begin(), sorted.end());
-            size_t mid = sorted.size() / 2;
-            double median = sorted.size() % 2 ? double(sorted[mid]) : (sorted[mid - 1] + sorted[mid]) / 2.0;
-            outf("%d of %d exchanges completed, latency median %.0f ms, worst %lld ms\n", completed, mOpt.rounds,
-                 median, static_cast<long long>(sorted.back()));
+            const size_t mid = sorted.size() / 2;
+            const double median = sorted.size() % 2 ? double(sorted[mid]) : (sorted[mid - 1] + sorted[mid]) / 2.0;
+            summary.add("median_ms", median).add("worst_ms", sorted.back());
+            resultf(summary, "%d of %s completed, %s median %.0f ms, worst %lld ms\n", completed,
+                    plural(mOpt.rounds, "exchange").c_str(),
+                    mOpt.noAck ? "one way" : "round trip", median, sorted.back());
         } else {
-            outf("0 of %d exchanges completed\n", mOpt.rounds);
+            resultf(summary, "0 of %s completed\n", plural(mOpt.rounds, "exchange").c_str());
         }
+        if (interrupted()) return 130;
+        if (!started) return 1;
+        if (!mStuck.empty()) return 1;  // its line is out
         std::string failed;
         for (int w = 0; w < 2; ++w) {
             if (status[w] <= 0) continue;  // 0: finished well; -1: never started
-            failed += std::string(failed.empty() ? "" : ", ") + kWhoName[w] + " exit " + std::to_string(status[w]);
+            failed += std::string(failed.empty() ? "" : ", ") + "the " + kWhoName[w] + " ended with status " +
+                      std::to_string(status[w]);
         }
-        if (!failed.empty() && !interrupted()) errf("a device failed (%s)", failed.c_str());
-        bool allRan = status[kListener] == 0 && status[kSpeaker] == 0;
-        return started && allRan && !mAborted && !interrupted() && completed == mOpt.rounds ? 0 : 1;
+        if (!failed.empty()) {
+            errf("%s", failed.c_str());
+            return 1;
+        }
+        if (completed != mOpt.rounds) {
+            errf("%d of %s completed", completed, plural(mOpt.rounds, "exchange").c_str());
+            return 1;
+        }
+        return 0;
     }
 
     const CommonOptions& mCommon;
@@ -256,9 +325,12 @@ private:
     ChildProcess mChild[2];
     bool mOpen[2] = {false, false};
     bool mReady[2] = {false, false};
+    int64_t mQuietUntil[2] = {0, 0};  // a device silent past this has stopped responding
+    std::string mStuck;               // the device that stopped responding
     bool mAborted = false;
-    std::map<int, long long> mSaidAt[2];  // round -> when the device said its code
-    std::vector<int64_t> mLatencies;       // per completed exchange, from the speaker's code
+    std::map<int, Round> mRounds;
+    std::map<int, bool> mCounted;
+    std::vector<long long> mLatencies;  // per completed exchange, from the speaker's code
 };
 
 }  // namespace
@@ -283,7 +355,7 @@ Command addDemoCommand(CLI::App& app, CommonOptions& common) {
            "add white noise to both microphones, this many dB below the tone, and raise the detection level "
            "above it (default: no noise); below about 15 dB code 0 is lost first, its band catching only a "
            "leak of its tone")
-        ->check(CLI::Range(-20.0, 120.0));
+        ->check(finiteRange(kMinSnr, 120.0));
     sub->add_option("--tone-ms", options->toneMs, "duration of each tone in milliseconds")
         ->check(CLI::Range(50, 5000))
         ->capture_default_str();

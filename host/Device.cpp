@@ -18,11 +18,6 @@ bool Device::open(const DeviceSettings& settings, std::string* error) {
     mMeter->makeToneGenerator(AUDIO_STREAM_MUSIC);
     mMeter->start_wf_thread();
     mMeter->startRecord();
-    if (mMeter->getRecordState() != 1) {
-        if (error) *error = "the microphone could not be started (see -v for the platform's reason)";
-        close();
-        return false;
-    }
     mMeter->setRole(settings.role);
     mMeter->setNeedAck(settings.needAck);
     if (settings.setLevel) mMeter->setDetectionLevel(settings.level);
@@ -38,11 +33,18 @@ void Device::close() {
     mMeter = nullptr;
 }
 
-Heard Device::hearUntil(int code, int64_t deadlineMs) {
+Outcome Device::interruption() {
+    if (interrupted()) return Outcome::Interrupted;
+    if (mWatch.failed()) return Outcome::RouteFailed;
+    return Outcome::Done;
+}
+
+Outcome Device::hearUntil(int code, int64_t deadlineMs) {
     for (;;) {
-        if (interrupted()) return Heard::Interrupted;
-        if (mMeter->HearFreqIdx(code) == code) return Heard::Yes;
-        if (monotonicMs() >= deadlineMs) return Heard::TimedOut;
+        const Outcome stop = interruption();
+        if (stop != Outcome::Done) return stop;
+        if (mMeter->HearFreqIdx(code) == code) return Outcome::Done;
+        if (monotonicMs() >= deadlineMs) return Outcome::TimedOut;
     }
 }
 
@@ -51,12 +53,23 @@ void Device::sayCode(int code, int durationMs) {
     mMeter->SayFreqIdx(code, durationMs);
 }
 
-bool Device::stepUntil(int64_t deadlineMs) {
+Outcome Device::stepUntil(int64_t deadlineMs) {
     while (monotonicMs() < deadlineMs) {
-        if (interrupted()) return false;
+        const Outcome stop = interruption();
+        if (stop != Outcome::Done) return stop;
         mMeter->processAudio();
     }
-    return !interrupted();
+    return interruption();
+}
+
+int exitStatusOf(Outcome outcome) {
+    switch (outcome) {
+        case Outcome::Done: return 0;
+        case Outcome::Interrupted: return 130;
+        case Outcome::TimedOut:
+        case Outcome::RouteFailed: return 1;
+    }
+    return 1;
 }
 
 }  // namespace host

@@ -5,6 +5,7 @@
 #include <string>
 
 #include "host/Plugin.h"
+#include "host/RouteGuard.h"
 #include "interface/SoundMeter_vir.h"
 
 namespace korvo {
@@ -19,13 +20,16 @@ struct DeviceSettings {
     bool needAck = false;
     bool setLevel = false;  // leave the detection level alone unless asked
     int level = 0;
+    RouteUse routes;        // the routes the command uses: checked first, then watched
 };
 
-enum class Heard { Yes, TimedOut, Interrupted };
+// How a wait ended: its goal (heard, or the time reached), time up, Ctrl-C, or a route
+// that failed (its line already printed).
+enum class Outcome { Done, TimedOut, Interrupted, RouteFailed };
 
 class Device {
 public:
-    explicit Device(const Plugin& plugin) : mPlugin(plugin) {}
+    Device(const Plugin& plugin, RouteWatch& watch) : mPlugin(plugin), mWatch(watch) {}
     Device(const Device&) = delete;
     Device& operator=(const Device&) = delete;
     ~Device() { close(); }
@@ -37,21 +41,27 @@ public:
 
     SoundMeter_vir& meter() { return *mMeter; }
 
-    // HearFreqIdx(code), one capture step per call, until heard, the deadline
-    // (monotonic ms) or an interrupt.
-    Heard hearUntil(int code, int64_t deadlineMs);
+    // HearFreqIdx(code), one capture step per call, until heard (Done), the deadline
+    // (monotonic ms), Ctrl-C or a failed route.
+    Outcome hearUntil(int code, int64_t deadlineMs);
     // Says one code. The saying gate is re-armed first (speaker state 0): on its own
     // the state machine lets a device say once per exchange, and a device running
     // several rounds has to open it again each time.
     void sayCode(int code, int durationMs);
-    // Capture steps until the deadline, so the microphone stays drained while the
-    // device waits; false when interrupted.
-    bool stepUntil(int64_t deadlineMs);
+    // Capture steps until the deadline (Done), so the microphone stays drained while the
+    // device waits.
+    Outcome stepUntil(int64_t deadlineMs);
+    // Ctrl-C or a failed route, if either happened.
+    Outcome interruption();
 
 private:
     const Plugin& mPlugin;
+    RouteWatch& mWatch;
     SoundMeter_vir* mMeter = nullptr;
 };
+
+// The exit status that goes with an outcome: 0 done, 1 time up or a failed route, 130 Ctrl-C.
+int exitStatusOf(Outcome outcome);
 
 }  // namespace host
 }  // namespace korvo

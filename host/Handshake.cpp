@@ -22,7 +22,7 @@
 
 #include "host/Clock.h"
 #include "host/CodePlan.h"
-#include "host/Interrupt.h"
+#include "host/JsonEvent.h"
 #include "host/Options.h"
 #include "host/Output.h"
 #include "host/Session.h"
@@ -52,23 +52,28 @@ int speakerCode(const HandshakeOptions& o, int round) {
 
 class Exchange {
 public:
-    Exchange(Device& device, const HandshakeOptions& o) : mDevice(device), mOpt(o) {}
+    Exchange(Session& session, const HandshakeOptions& o) : mSession(session), mDevice(session.device()), mOpt(o) {}
 
-    // Runs the rounds; the number completed.
-    int run(bool speaker) {
+    // Runs the rounds; the number completed. `stop` tells why it stopped early, if it did.
+    int run(bool speaker, Outcome* stop) {
         int completed = 0;
-        for (int r = 0; r < mOpt.rounds && !interrupted(); ++r) {
-            bool ok = speaker ? speakerRound(r) : listenerRound(r);
-            if (!ok) break;  // the peer and this device no longer agree on the round
+        *stop = Outcome::Done;
+        for (int r = 0; r < mOpt.rounds; ++r) {
+            if ((*stop = mSession.interruption()) != Outcome::Done) break;
+            const Outcome o = speaker ? speakerRound(r) : listenerRound(r);
+            if (o != Outcome::Done) {
+                *stop = o;
+                break;  // the peer and this device no longer agree on the round
+            }
             ++completed;
         }
         // The last tone said is still sounding; tearing down now would cut it.
-        if (mLastSaidAt >= 0) mDevice.stepUntil(mLastSaidAt + mOpt.toneMs + kToneTailMs);
+        if (*stop == Outcome::Done && mLastSaidAt >= 0) *stop = mDevice.stepUntil(mLastSaidAt + mOpt.toneMs + kToneTailMs);
         return completed;
     }
 
 private:
-    bool speakerRound(int r) {
+    Outcome speakerRound(int r) {
         int code = speakerCode(mOpt, r);
         if (!mOpt.noAck) {
             say(r, code);
@@ -76,16 +81,19 @@ private:
         }
         // Without acknowledgement nothing comes back: leave a gap after each tone so
         // that two tones never overlap in the room.
-        if (mLastSaidAt >= 0 && !mDevice.stepUntil(mLastSaidAt + mOpt.toneMs + kToneTailMs)) return false;
+        if (mLastSaidAt >= 0) {
+            const Outcome gap = mDevice.stepUntil(mLastSaidAt + mOpt.toneMs + kToneTailMs);
+            if (gap != Outcome::Done) return gap;
+        }
         say(r, code);
-        return true;
+        return Outcome::Done;
     }
 
-    bool listenerRound(int r) {
+    Outcome listenerRound(int r) {
         int code = speakerCode(mOpt, r);
-        if (!hear(r, code)) return false;
-        if (!mOpt.noAck) say(r, code + 1);
-        return true;
+        const Outcome heard = hear(r, code);
+        if (heard == Outcome::Done && !mOpt.noAck) say(r, code + 1);
+        return heard;
     }
 
     void say(int r, int code) {
@@ -93,20 +101,23 @@ private:
         // however the call and the printing are scheduled.
         mLastSaidAt = monotonicMs();
         mDevice.sayCode(code, mOpt.toneMs);
-        outf("said round=%d code=%d hz=%d t=%lld\n", r + 1, code, codeHz(code),
-             static_cast<long long>(mLastSaidAt));
+        progressf(JsonEvent("said").add("round", r + 1).add("code", code).add("hz", codeHz(code)).add("t", mLastSaidAt),
+                "said round=%d code=%d hz=%d t=%lld\n", r + 1, code, codeHz(code), static_cast<long long>(mLastSaidAt));
     }
 
-    bool hear(int r, int code) {
-        int64_t start = monotonicMs();
-        Heard heard = mDevice.hearUntil(code, start + mOpt.timeoutMs);
-        int64_t now = monotonicMs();
-        if (heard == Heard::Interrupted) return false;
-        outf("%s round=%d code=%d hz=%d t=%lld waited=%lld\n", heard == Heard::Yes ? "heard" : "timeout", r + 1,
-             code, codeHz(code), static_cast<long long>(now), static_cast<long long>(now - start));
-        return heard == Heard::Yes;
+    Outcome hear(int r, int code) {
+        const int64_t start = monotonicMs();
+        const Outcome heard = mDevice.hearUntil(code, start + mOpt.timeoutMs);
+        const int64_t now = monotonicMs();
+        if (heard != Outcome::Done && heard != Outcome::TimedOut) return heard;
+        const char* event = heard == Outcome::Done ? "heard" : "timeout";
+        progressf(JsonEvent(event).add("round", r + 1).add("code", code).add("hz", codeHz(code)).add("t", now).add("waited_ms", now - start),
+                "%s round=%d code=%d hz=%d t=%lld waited=%lld\n", event, r + 1, code, codeHz(code),
+                static_cast<long long>(now), static_cast<long long>(now - start));
+        return heard;
     }
 
+    Session& mSession;
     Device& mDevice;
     const HandshakeOptions& mOpt;
     int64_t mLastSaidAt = -1;
@@ -126,16 +137,24 @@ int runHandshake(const CommonOptions& common, const HandshakeOptions& o) {
     settings.needAck = !o.noAck;
     settings.setLevel = o.levelGiven;
     settings.level = o.level;
+    settings.routes.mic = !speaker || !o.noAck;
+    settings.routes.speaker = speaker || !o.noAck;
     if (int status = session.open(settings)) return status;
-    outf("ready role=%s ack=%d rounds=%d t=%lld\n", o.role.c_str(), o.noAck ? 0 : 1, o.rounds,
-         static_cast<long long>(monotonicMs()));
+    const long long t = monotonicMs();
+    progressf(JsonEvent("ready").add("role", o.role).add("ack", !o.noAck).add("rounds", o.rounds).add("t", t),
+            "ready role=%s ack=%d rounds=%d t=%lld\n", o.role.c_str(), o.noAck ? 0 : 1, o.rounds, t);
 
-    Exchange exchange(session.device(), o);
-    int completed = exchange.run(speaker);
+    Exchange exchange(session, o);
+    Outcome stop = Outcome::Done;
+    const int completed = exchange.run(speaker, &stop);
     session.close();
-    outf("done completed=%d rounds=%d t=%lld\n", completed, o.rounds, static_cast<long long>(monotonicMs()));
-    if (interrupted()) errf("interrupted after %d of %d rounds", completed, o.rounds);
-    return completed == o.rounds ? 0 : 1;
+    if (stop == Outcome::Interrupted || stop == Outcome::RouteFailed) return exitStatusOf(stop);
+    const long long end = monotonicMs();
+    resultf(JsonEvent("summary").add("completed", completed).add("rounds", o.rounds).add("t", end),
+            "done completed=%d rounds=%d t=%lld\n", completed, o.rounds, end);
+    if (completed == o.rounds) return 0;
+    errf("%d of %s completed", completed, plural(o.rounds, "round").c_str());
+    return 1;
 }
 
 }  // namespace
@@ -165,13 +184,8 @@ Command addHandshakeCommand(CLI::App& app, CommonOptions& common) {
                     "acknowledgement)")
         ->check(CLI::Range(0, kHearableCodes - 1))
         ->capture_default_str();
-    sub->add_option_function<int>(
-           "--level",
-           [options](const int& v) {
-               options->level = v;
-               options->levelGiven = true;
-           },
-           "detection level: spectrum levels at or below it count as silence (raise it in noise)");
+    addLevelOption(sub, &options->level, &options->levelGiven,
+                   "detection level: spectrum levels at or below it count as silence (raise it in noise)");
     addRouteOptions(sub, common);
     return {sub, [&common, options] { return runHandshake(common, *options); }};
 }

@@ -3,10 +3,11 @@
 
 #include <CLI/CLI.hpp>
 
+#include <korvo/platform/Routes.h>
+
 #include "host/Clock.h"
 #include "host/CodePlan.h"
 #include "host/CodeTracker.h"
-#include "host/Interrupt.h"
 #include "host/Options.h"
 #include "host/Output.h"
 #include "host/Session.h"
@@ -23,6 +24,16 @@ struct MonitorOptions {
 };
 
 constexpr int64_t kRefreshMs = 150;
+// After a file's last sample its last frames are still being analysed.
+constexpr int64_t kFileTailMs = 250;
+
+// True a moment after a file microphone has delivered its last sample.
+bool fileEnded(int64_t now) {
+    static int64_t endedAt = -1;
+    const korvo::platform::SourceProgress p = korvo::platform::microphoneStatus().progress;
+    if (p.finite && p.ended && endedAt < 0) endedAt = now;
+    return endedAt >= 0 && now >= endedAt + kFileTailMs;
+}
 constexpr int kBarWidth = 50;  // two level units per character, level 100 = full scale
 constexpr int kFrameLines = kHearableCodes + 4;
 
@@ -69,6 +80,7 @@ int runMonitor(const CommonOptions& common, const MonitorOptions& o) {
     settings.role = 1;
     settings.setLevel = o.levelGiven;
     settings.level = o.level;
+    settings.routes.mic = true;
     if (int status = session.open(settings)) return status;
     SoundMeter_vir& meter = session.meter();
     // Redraw in place on a terminal; elsewhere (a pipe, a file) frames follow each other.
@@ -81,7 +93,9 @@ int runMonitor(const CommonOptions& common, const MonitorOptions& o) {
     int64_t end = o.seconds > 0 ? start + static_cast<int64_t>(o.seconds * 1000.0) : INT64_MAX;
     int64_t nextDraw = start;
     bool first = true;
-    for (int64_t now = start; now < end && !interrupted(); now = monotonicMs()) {
+    Outcome outcome = Outcome::Done;
+    for (int64_t now = start; now < end && !fileEnded(now); now = monotonicMs()) {
+        if ((outcome = session.interruption()) != Outcome::Done) break;
         meter.processAudio();
         lookAtSpectrum(meter, &look);
         tracker.update(monotonicMs(), look.codeFirst, look.codeSecond);
@@ -93,7 +107,7 @@ int runMonitor(const CommonOptions& common, const MonitorOptions& o) {
     }
     if (ansi) outf("\x1b[?25h");
     session.close();
-    return 0;  // Ctrl-C is the normal end
+    return exitStatusOf(outcome);
 }
 
 }  // namespace
@@ -104,16 +118,10 @@ Command addMonitorCommand(CLI::App& app, CommonOptions& common) {
         "monitor",
         "Live view of the read-out: the level of each hearable code's band as a bar, the detection level "
         "and the code heard; Ctrl-C ends it.");
-    sub->add_option_function<int>(
-           "--level",
-           [options](const int& v) {
-               options->level = v;
-               options->levelGiven = true;
-           },
-           "detection level: spectrum levels at or below it count as silence")
-        ->check(CLI::Range(-1000, 1000));
-    sub->add_option("--seconds", options->seconds, "stop after this many seconds; 0: until Ctrl-C")
-        ->check(CLI::Range(0.0, 86400.0))
+    addLevelOption(sub, &options->level, &options->levelGiven,
+                   "detection level: spectrum levels at or below it count as silence");
+    sub->add_option("--seconds", options->seconds, "stop after this many seconds; 0: until Ctrl-C (or the file's end)")
+        ->check(finiteRange(0.0, 86400.0))
         ->capture_default_str();
     addRouteOptions(sub, common);
     return {sub, [&common, options] { return runMonitor(common, *options); }};

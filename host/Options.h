@@ -5,7 +5,8 @@
 
 namespace CLI {
 class App;
-}
+class Validator;
+}  // namespace CLI
 
 namespace korvo {
 namespace host {
@@ -13,11 +14,14 @@ namespace host {
 struct CommonOptions {
     std::string plugin;   // --plugin; empty: KORVO_PLUGIN or the default path
     int verbose = 0;      // -v: platform log at D on stderr, -vv: at V
+    bool quiet = false;   // -q: only results and errors
+    bool json = false;    // --json: one JSON object per event
     std::string mic;      // --mic; empty: KORVO_MIC as the environment has it
     std::string speaker;  // --speaker; empty: KORVO_SPEAKER as the environment has it
 };
 
-// Runs the parsed command; returns the exit status.
+// Runs the parsed command; returns the exit status:
+// 0 success, 1 the job failed, 2 bad usage or an unusable route, 130 after Ctrl-C.
 using Action = std::function<int()>;
 
 struct Command {
@@ -25,6 +29,14 @@ struct Command {
     Action action;
 };
 
+// Detection levels, the same range in every command (level 100 = full scale, 1 unit = 1.2 dB).
+constexpr int kMinLevel = -100;
+constexpr int kMaxLevel = 200;
+
+// A number that is finite and within [lo, hi] ("nan", "inf" and the like are refused).
+CLI::Validator finiteRange(double lo, double hi);
+// --level, stored in *level with *given set.
+void addLevelOption(CLI::App* sub, int* level, bool* given, const char* help);
 // Adds --mic and --speaker, checked as ROUTE texts; the defaults are named in their help.
 void addRouteOptions(CLI::App* sub, CommonOptions& common, const char* micDefault = "KORVO_MIC, else null",
                      const char* speakerDefault = "KORVO_SPEAKER, else null");
@@ -35,6 +47,7 @@ Command addSayCommand(CLI::App& app, CommonOptions& common);
 Command addSweepCommand(CLI::App& app, CommonOptions& common);
 Command addHandshakeCommand(CLI::App& app, CommonOptions& common);
 Command addMonitorCommand(CLI::App& app, CommonOptions& common);
+Command addDevicesCommand(CLI::App& app, CommonOptions& common);
 
 }  // namespace host
 }  // namespace korvo

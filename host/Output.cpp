@@ -1,5 +1,7 @@
 #include "host/Output.h"
 
+#include "host/JsonEvent.h"
+
 #include <fcntl.h>
 #include <unistd.h>
 
@@ -37,6 +39,56 @@ void outf(const char* fmt, ...) {
     vfprintf(hostOut(), fmt, ap);
     va_end(ap);
     fflush(hostOut());
+}
+
+namespace {
+OutputMode gMode = OutputMode::Normal;
+
+void vprint(const char* fmt, va_list ap) {
+    vfprintf(hostOut(), fmt, ap);
+    fflush(hostOut());
+}
+}  // namespace
+
+void setOutputMode(OutputMode mode) { gMode = mode; }
+
+OutputMode outputMode() { return gMode; }
+
+void infof(const char* fmt, ...) {
+    if (gMode != OutputMode::Normal) return;
+    va_list ap;
+    va_start(ap, fmt);
+    vprint(fmt, ap);
+    va_end(ap);
+}
+
+namespace {
+// An event as JSON with --json; else its line, in quiet mode only when it is a result.
+void emit(const JsonEvent& event, bool result, const char* fmt, va_list ap) {
+    if (gMode == OutputMode::Json) {
+        outf("%s\n", event.text().c_str());
+    } else if (result || gMode == OutputMode::Normal) {
+        vprint(fmt, ap);
+    }
+}
+}  // namespace
+
+void resultf(const JsonEvent& event, const char* fmt, ...) {
+    va_list ap;
+    va_start(ap, fmt);
+    emit(event, true, fmt, ap);
+    va_end(ap);
+}
+
+void progressf(const JsonEvent& event, const char* fmt, ...) {
+    va_list ap;
+    va_start(ap, fmt);
+    emit(event, false, fmt, ap);
+    va_end(ap);
+}
+
+std::string plural(long long n, const char* one, const char* many) {
+    return std::to_string(n) + " " + (n == 1 ? one : many ? many : std::string(one) + "s");
 }
 
 bool hostOutputIsTerminal() { return isatty(fileno(hostOut())) != 0; }

@@ -15,10 +15,26 @@
 namespace korvo {
 namespace host {
 
+class JsonEvent;
+
 // Takes the private duplicate of standard output; call once, first thing in main.
 void initHostOutput();
-// printf to the host's own standard output, flushed at once.
+// printf to the host's own standard output, flushed at once, whatever the mode.
 void outf(const char* fmt, ...) __attribute__((format(printf, 1, 2)));
+
+// What the host prints: everything; only results and errors (-q); or one JSON object
+// per event instead of the result lines (--json). Errors go to stderr in every mode.
+enum class OutputMode { Normal, Quiet, Json };
+void setOutputMode(OutputMode mode);
+OutputMode outputMode();
+// A line of progress or context, shown in normal mode only.
+void infof(const char* fmt, ...) __attribute__((format(printf, 1, 2)));
+// A result: its line in normal and quiet mode, the event's JSON object with --json.
+void resultf(const JsonEvent& event, const char* fmt, ...) __attribute__((format(printf, 2, 3)));
+// A step on the way: its line in normal mode, the event's JSON object with --json.
+void progressf(const JsonEvent& event, const char* fmt, ...) __attribute__((format(printf, 2, 3)));
+// "1 code", "2 codes".
+std::string plural(long long n, const char* one, const char* many = nullptr);
 // Whether the host's own standard output is a terminal (descriptor 1 may be a pipe
 // to the plug-in's line handler meanwhile).
 bool hostOutputIsTerminal();

@@ -1,9 +1,11 @@
 // soundmeter say CODE: one code, said once by a speaker device.
 #include <CLI/CLI.hpp>
 
+#include <korvo/platform/Routes.h>
+
 #include "host/Clock.h"
 #include "host/CodePlan.h"
-#include "host/Interrupt.h"
+#include "host/JsonEvent.h"
 #include "host/Options.h"
 #include "host/Output.h"
 #include "host/Session.h"
@@ -21,24 +23,29 @@ int runSay(const CommonOptions& common, const SayOptions& o) {
     Session session(common);
     DeviceSettings settings;
     settings.role = 2;  // speaker, no acknowledgement: saying leaves nothing to wait for
+    settings.routes.speaker = true;
     if (int status = session.open(settings)) return status;
-    if (!codeHearable(o.code)) errf("note: code %d (%d Hz) %s", o.code, codeHz(o.code), codeReach(o.code));
+    noteSilentSpeaker();
+    if (!codeHearable(o.code)) infof("note: code %d (%d Hz) %s\n", o.code, codeHz(o.code), codeReach(o.code));
 
-    int64_t start = monotonicMs();
+    const int64_t start = monotonicMs();
     session.device().sayCode(o.code, o.ms);
-    outf("saying code %d (%d Hz) for %d ms\n", o.code, codeHz(o.code), o.ms);
+    infof("saying code %d (%d Hz) for %d ms\n", o.code, codeHz(o.code), o.ms);
     // The engine fades the tone out by itself; tearing down earlier would cut it.
-    bool done = session.device().stepUntil(start + o.ms + kToneTailMs);
+    const Outcome outcome = session.device().stepUntil(start + o.ms + kToneTailMs);
     session.close();
-    if (!done) {
-        errf("interrupted before code %d was said to the end", o.code);
-        return 1;
-    }
-    outf("said code %d (%d Hz)\n", o.code, codeHz(o.code));
+    if (outcome != Outcome::Done) return exitStatusOf(outcome);
+    resultf(JsonEvent("said").add("code", o.code).add("hz", codeHz(o.code)).add("ms", o.ms), "said code %d (%d Hz)\n",
+            o.code, codeHz(o.code));
     return 0;
 }
 
 }  // namespace
+
+void noteSilentSpeaker() {
+    if (korvo::platform::speakerRoute() != "null" || outputMode() != OutputMode::Normal) return;
+    errf("note: the speaker route is null, so nothing is audible; add --speaker card to play through the sound card");
+}
 
 Command addSayCommand(CLI::App& app, CommonOptions& common) {
     auto options = std::make_shared<SayOptions>();

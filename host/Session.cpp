@@ -14,6 +14,8 @@ int Session::open(const DeviceSettings& settings, LibraryStdout::LineHandler han
         errf("%s", error.c_str());
         return 2;
     }
+    if (int status = checkRoutes(settings.routes)) return status;
+    mWatch = RouteWatch(settings.routes);
     if (!handler) handler = libraryLinesToStderr(mCommon.verbose > 0);
     if (!mStdout.start(std::move(handler), &error)) {
         errf("%s", error.c_str());
@@ -24,7 +26,7 @@ int Session::open(const DeviceSettings& settings, LibraryStdout::LineHandler han
         errf("%s", error.c_str());
         return 1;
     }
-    mDevice = std::make_unique<Device>(mPlugin);
+    mDevice = std::make_unique<Device>(mPlugin, mWatch);
     if (!mDevice->open(settings, &error)) {
         close();
         errf("%s", error.c_str());

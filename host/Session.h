@@ -11,6 +11,10 @@
 namespace korvo {
 namespace host {
 
+// On the null speaker route, says once (on stderr, in normal mode) that nothing is
+// audible and how to play through the sound card.
+void noteSilentSpeaker();
+
 class Session {
 public:
     explicit Session(const CommonOptions& common) : mCommon(common) {}
@@ -18,18 +22,22 @@ public:
     Session& operator=(const Session&) = delete;
     ~Session() { close(); }
 
-    // Brings the device up. 0 on success; otherwise one line was printed and the
-    // result is the exit status (2 for a bad route, 1 when the plug-in or the
-    // device failed). Without a handler the plug-in's stdout lines follow -v.
+    // Checks the routes the settings name, then brings the device up. 0 on success;
+    // otherwise one line was printed and the result is the exit status (2 for an
+    // unusable route, 1 when the plug-in or the device failed). Without a handler the
+    // plug-in's stdout lines follow -v.
     int open(const DeviceSettings& settings, LibraryStdout::LineHandler handler = nullptr);
     // Tears down in order: device, plug-in, standard output.
     void close();
 
     Device& device() { return *mDevice; }
     SoundMeter_vir& meter() { return mDevice->meter(); }
+    // Ctrl-C or a failed route (its line printed once), if either happened.
+    Outcome interruption() { return mDevice->interruption(); }
 
 private:
     CommonOptions mCommon;
+    RouteWatch mWatch;
     LibraryStdout mStdout;
     Plugin mPlugin;
     std::unique_ptr<Device> mDevice;

@@ -14,7 +14,7 @@
 
 #include "host/Clock.h"
 #include "host/CodePlan.h"
-#include "host/Interrupt.h"
+#include "host/JsonEvent.h"
 #include "host/Options.h"
 #include "host/Output.h"
 #include "host/Session.h"
@@ -70,26 +70,34 @@ int runSweep(const CommonOptions& common, const SweepOptions& o) {
     DeviceSettings settings;
     settings.role = 2;
     settings.needAck = !o.noAck;
+    settings.routes.speaker = true;
+    settings.routes.mic = !o.noAck;  // answers are heard
     if (int status = session.open(settings, said.handler(common.verbose > 0))) return status;
+    noteSilentSpeaker();
     SoundMeter_vir& meter = session.meter();
-    outf("sweeping for %.1f s, tones of %d ms, acknowledgement %s\n", o.seconds, o.ms, o.noAck ? "off" : "on");
+    infof("sweeping for %.1f s, tones of %d ms, acknowledgement %s\n", o.seconds, o.ms, o.noAck ? "off" : "on");
 
     int saidCount = 0;
     int answered = 0;
     int awaiting = -1;  // the answer being listened for, -1 when none
     int64_t awaitUntil = 0;
-    int64_t start = monotonicMs();
-    int64_t end = start + static_cast<int64_t>(o.seconds * 1000.0);
+    int64_t saidAt = 0;
+    Outcome outcome = Outcome::Done;
+    const int64_t start = monotonicMs();
+    const int64_t end = start + static_cast<int64_t>(o.seconds * 1000.0);
     int64_t nextCall = start;
-    for (int64_t now = start; now < end && !interrupted(); now = monotonicMs()) {
+    for (int64_t now = start; now < end; now = monotonicMs()) {
+        if ((outcome = session.interruption()) != Outcome::Done) break;
         if (awaiting >= 0) {
             if (meter.HearFreqIdx(awaiting) == awaiting) {
                 ++answered;
-                outf("%8.3f s  heard answer code %d (%d Hz)\n", (monotonicMs() - start) / 1000.0, awaiting,
-                     codeHz(awaiting));
+                const int64_t roundTrip = monotonicMs() - saidAt;
+                progressf(JsonEvent("heard").add("code", awaiting).add("hz", codeHz(awaiting)).add("round_trip_ms", roundTrip),
+                        "%8.3f s  heard answer code %d (%d Hz), round trip %lld ms\n", (monotonicMs() - start) / 1000.0,
+                        awaiting, codeHz(awaiting), static_cast<long long>(roundTrip));
                 awaiting = -1;
             } else if (now >= awaitUntil) {
-                outf("%8.3f s  no answer code %d\n", (now - start) / 1000.0, awaiting);
+                infof("%8.3f s  no answer code %d\n", (now - start) / 1000.0, awaiting);
                 // As if answered: the sweep's pause then lets the next code be said.
                 meter.setSpeakerState(10);
                 awaiting = -1;
@@ -103,20 +111,26 @@ int runSweep(const CommonOptions& common, const SweepOptions& o) {
         }
         for (int code; (code = said.take()) >= 0;) {
             ++saidCount;
-            outf("%8.3f s  said code %d (%d Hz)%s\n", (monotonicMs() - start) / 1000.0, code,
-                 code < kCodeCount ? codeHz(code) : 0, codeHearable(code) ? "" : ", cannot be heard");
+            saidAt = monotonicMs();
+            const int hz = code < kCodeCount ? codeHz(code) : 0;
+            progressf(JsonEvent("said").add("code", code).add("hz", hz).add("ms", o.ms).add("t_s", (saidAt - start) / 1000.0),
+                    "%8.3f s  said code %d (%d Hz)%s\n", (saidAt - start) / 1000.0, code, hz,
+                    codeHearable(code) ? "" : ", cannot be heard");
             if (!o.noAck) {
                 awaiting = korvo::acknowledgementOf(code);
-                awaitUntil = monotonicMs() + o.ms + kAnswerWaitMs;
+                awaitUntil = saidAt + o.ms + kAnswerWaitMs;
             }
         }
     }
-    session.device().stepUntil(monotonicMs() + o.ms + kToneTailMs);  // let the last tone end
+    if (outcome == Outcome::Done) outcome = session.device().stepUntil(monotonicMs() + o.ms + kToneTailMs);
     session.close();
+    if (outcome != Outcome::Done) return exitStatusOf(outcome);
+    JsonEvent summary("summary");
+    summary.add("said", saidCount);
     if (o.noAck) {
-        outf("said %d codes\n", saidCount);
+        resultf(summary, "said %s\n", plural(saidCount, "code").c_str());
     } else {
-        outf("said %d codes, %d answered\n", saidCount, answered);
+        resultf(summary.add("answered", answered), "said %s, %d answered\n", plural(saidCount, "code").c_str(), answered);
     }
     return 0;
 }
@@ -133,7 +147,7 @@ Command addSweepCommand(CLI::App& app, CommonOptions& common) {
         ->check(CLI::Range(20, 10000))
         ->capture_default_str();
     sub->add_option("--seconds", options->seconds, "how long to sweep")
-        ->check(CLI::Range(0.1, 86400.0))
+        ->check(finiteRange(0.1, 86400.0))
         ->capture_default_str();
     sub->add_flag("--no-ack", options->noAck, "do not wait for answers");
     addRouteOptions(sub, common);

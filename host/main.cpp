@@ -1,6 +1,7 @@
 // soundmeter: a host of the korvo_soundmeter plug-in. It loads the plug-in with
 // dlopen and drives it only through its factory, its interface and its destroy
 // function, as a product embedding the plug-in would.
+#include <csignal>
 #include <string>
 #include <vector>
 
@@ -18,6 +19,8 @@ namespace {
 void addCommonFlags(CLI::App* app, CommonOptions& common) {
     app->add_flag("-v,--verbose", common.verbose,
                   "platform log on stderr (-v: debug, -vv: verbose) and the plug-in's own stdout lines");
+    app->add_flag("-q,--quiet", common.quiet, "print only results and errors");
+    app->add_flag("--json", common.json, "print one JSON object per event (heard, said, exchange, summary)");
     app->add_option("--plugin", common.plugin,
                     "plug-in to load (default: KORVO_PLUGIN, else ../lib/libkorvo_soundmeter.so next to "
                     "this program)");
@@ -40,6 +43,7 @@ int main(int argc, char** argv) {
     std::vector<Command> commands = {
         addDemoCommand(app, common),   addListenCommand(app, common),    addSayCommand(app, common),
         addSweepCommand(app, common),  addHandshakeCommand(app, common), addMonitorCommand(app, common),
+        addDevicesCommand(app, common),
     };
     for (Command& c : commands) addCommonFlags(c.app, common);
 
@@ -53,7 +57,7 @@ int main(int argc, char** argv) {
             if (rest.front().rfind("-", 0) == 0) {
                 errf("unknown option '%s'", rest.front().c_str());
             } else {
-                errf("unknown command '%s' (expected demo, listen, say, sweep, handshake or monitor)",
+                errf("unknown command '%s' (expected demo, listen, say, sweep, handshake, monitor or devices)",
                      rest.front().c_str());
             }
         } else {
@@ -61,8 +65,22 @@ int main(int argc, char** argv) {
         }
         return 2;
     }
+    if (common.quiet && common.json) {
+        errf("-q and --json cannot be used together");
+        return 2;
+    }
+    setOutputMode(common.json ? OutputMode::Json : common.quiet ? OutputMode::Quiet : OutputMode::Normal);
     for (Command& c : commands) {
-        if (c.app->parsed()) return c.action();
+        if (!c.app->parsed()) continue;
+        const int status = c.action();
+        // Ctrl-C ends every command the same way, with one line. SIGTERM comes from another
+        // process (the demo stopping its devices): that one knows, nothing to say.
+        if (interruptSignal() == SIGTERM) return 143;
+        if (interrupted()) {
+            errf("interrupted");
+            return 130;
+        }
+        return status;
     }
     return 2;
 }

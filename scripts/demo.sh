@@ -6,5 +6,12 @@ cd "$(dirname "$0")/.."
 
 scripts/install-deps.sh
 cmake --preset default >/dev/null
-cmake --build --preset default >/dev/null
+# The first build takes a few minutes on a small machine: show how far it is.
+echo "building (the first time takes a few minutes)..." >&2
+cmake --build --preset default | while IFS= read -r line; do
+  case "$line" in
+    "["*"%]"*) printf '\r  %s' "${line%%]*}]" >&2 ;;
+  esac
+done
+printf '\r  done.  \n' >&2
 exec build/bin/soundmeter demo "$@"

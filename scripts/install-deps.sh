@@ -1,12 +1,17 @@
 #!/usr/bin/env bash
 # Installs, from Debian's packages, whatever the build and the tests need and is missing.
+#   scripts/install-deps.sh            the default toolchain (g++)
+#   scripts/install-deps.sh clang ...  also clang, for the clang preset
 set -euo pipefail
 
 packages=(
   g++ cmake make pkg-config binutils
-  libgtest-dev libgmock-dev libbenchmark-dev
+  libgtest-dev libgmock-dev libbenchmark-dev nlohmann-json3-dev
   libsndfile1-dev portaudio19-dev libcli11-dev libfftw3-dev
 )
+for preset in "$@"; do
+  if [ "$preset" = clang ]; then packages+=(clang); fi
+done
 
 missing=()
 for p in "${packages[@]}"; do

@@ -295,11 +295,11 @@ def template_brackets(toks):
     return marked
 
 
+# A preprocessing number (covers 1.5e-3, 0x1p4, 10ms), then whether it is an integer.
+PP_NUMBER_RE = re.compile(r"(?<![\w.'])\.?[0-9](?:[eEpP][+-]|[\w.'])*")
 INT_RE = re.compile(
-    r"(?<![\w.'])"
     r"(0[xX][0-9a-fA-F]+(?:'[0-9a-fA-F]+)*|0[bB][01]+(?:'[01]+)*|[0-9]+(?:'[0-9]+)*)"
-    r"([uU](?:ll|LL|l|L)?|(?:ll|LL|l|L)[uU]?)?"
-    r"(?![\w.'])")
+    r"([uU](?:ll|LL|l|L)?|(?:ll|LL|l|L)[uU]?)?")
 
 
 def bump_literal(lit):
@@ -342,11 +342,14 @@ def line_sites(orig, m):
                 continue  # T&& x, auto&& are references
             new = LOGIC_FLIP[t]
             sites.append((col, "logic %s -> %s" % (t, new), orig[:col] + new + orig[end:]))
-    for mm in INT_RE.finditer(m):
+    for pp in PP_NUMBER_RE.finditer(m):
+        mm = INT_RE.fullmatch(pp.group())
+        if not mm:
+            continue  # floating or user-defined literal
         lit = mm.group(1)
         new = bump_literal(lit)
-        col = mm.start(1)
-        sites.append((col, "const %s -> %s" % (lit, new), orig[:col] + new + orig[mm.end(1):]))
+        col = pp.start()
+        sites.append((col, "const %s -> %s" % (lit, new), orig[:col] + new + orig[col + len(lit):]))
     return sites
 
 
@@ -781,7 +784,12 @@ def run_mutant(runner, backup, site, rel, lineno):
         if rc != 0:
             if rc is not None and build_failure_is_crash(out):
                 return "killed", "test program failed at listing"
-            return "stillborn", ""
+            if rc is None:
+                return "stillborn", "build overran %d s" % BUILD_LIMIT
+            first = re.search(r"^.*(?:error:|undefined reference).*$", out, re.M)
+            if not first:
+                return "stillborn", ""
+            return "stillborn", clip(first.group().strip().replace(str(runner.tree) + "/", ""), 110)
         rc, out = runner.ctest("--stop-on-failure")
         if rc == 0:
             return "survived", ""
@@ -855,11 +863,8 @@ class Output:
 
 
 def main():
-    ap = argparse.ArgumentParser(
-        description="Mutation testing of the library folders (%s)." % " ".join(LIB_DIRS),
-        epilog="Examples:  scripts/mutate.py --seed 9 --count 40 --save sites.json "
-               "--report before.txt    |    scripts/mutate.py --sites sites.json "
-               "--report after.txt")
+    ap = argparse.ArgumentParser(description=__doc__,
+                                 formatter_class=argparse.RawDescriptionHelpFormatter)
     ap.add_argument("--seed", type=int, help="seed of the random choice of sites")
     ap.add_argument("--count", type=int, help="number of sites to pick")
     ap.add_argument("--sites", type=Path, help="replay the sites saved in this JSON file")

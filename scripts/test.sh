@@ -6,12 +6,11 @@
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
-scripts/install-deps.sh
-
 presets=("$@")
 if [ ${#presets[@]} -eq 0 ]; then
   presets=(default asan tsan)
 fi
+scripts/install-deps.sh "${presets[@]}"
 
 status=0
 for preset in "${presets[@]}"; do

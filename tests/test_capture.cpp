@@ -5,6 +5,8 @@
 #include <cstring>
 #include <thread>
 
+#include <korvo/platform/Routes.h>
+
 #include "analysis/WaveformCanvas.h"
 #include "capture/CaptureLoop.h"
 #include "capture/CaptureStream.h"
@@ -270,6 +272,28 @@ TEST_F(Capture, StopDuringABlockedReadGivesTheStepUp) {
     EXPECT_EQ(readShared().count, 0);  // nothing published
     EXPECT_EQ(pthread_mutex_trylock(&AudioBufferLock), 0);
     pthread_mutex_unlock(&AudioBufferLock);
+}
+
+TEST_F(Capture, HearingOnAnUnusableRouteIsPacedLikeAMicrophone) {
+    test::scriptMic(false);
+    setenv("KORVO_MIC", "wav:/nonexistent/x.wav", 1);
+    SoundMeter meter;
+    meter.setRole(1);
+    meter.startRecord();
+    unsetenv("KORVO_MIC");
+    const korvo::platform::RouteStatus status = korvo::platform::microphoneStatus();
+    EXPECT_TRUE(status.failed && status.reason.rfind("wav:/nonexistent/x.wav: cannot", 0) == 0) << status.reason;
+    timespec cpu0, cpu1;
+    clock_gettime(CLOCK_THREAD_CPUTIME_ID, &cpu0);
+    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(1);
+    int steps = 0;
+    for (; std::chrono::steady_clock::now() < end; ++steps) meter.HearFreqIdx(3);
+    clock_gettime(CLOCK_THREAD_CPUTIME_ID, &cpu1);
+    // A read that cannot deliver takes a frame's time (11.6 ms): about 86 steps a second.
+    EXPECT_LE(steps, 100);
+    EXPECT_EQ(logOf("TQX", "Audio read failed").size(), size_t(steps));
+    EXPECT_LT((cpu1.tv_sec - cpu0.tv_sec) * 1e3 + (cpu1.tv_nsec - cpu0.tv_nsec) / 1e6, 50.0);  // under 5 % of a core
+    meter.stopRecord();
 }
 
 TEST_F(Capture, PublishedFrameWaitsForTheAnalysisThread) {

@@ -1,148 +1,164 @@
-// The soundmeter program's command line, run as a user would run it.
+// The soundmeter command as a user meets it: usage, unusable routes, routes that fail
+// while it runs, Ctrl-C, and its output modes.
+#include <signal.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <fstream>
 #include <regex>
-#include <string>
-#include <vector>
 
 #include <gtest/gtest.h>
+#include <nlohmann/json.hpp>
 
 #include "support/HostProcess.h"
+#include "support/LibraryTestSupport.h"
 
 namespace {
 
-using korvo::testing::EnvList;
-using korvo::testing::linesOf;
-using korvo::testing::ProcessResult;
-using korvo::testing::runHost;
-
+using namespace korvo::testing;
 const std::string kHost = KORVO_HOST_PATH;
-constexpr int kQuickMs = 30000;  // generous: the machine may be busy with other tests
+constexpr int kRunMs = 60000;  // generous bounds: the machine may be busy with other tests
 
-ProcessResult run(const std::vector<std::string>& args, const EnvList& env = {}) {
-    return runHost(kHost, args, kQuickMs, env);
+ProcessResult run(const std::vector<std::string>& args, const EnvList& env = {}) { return runHost(kHost, args, kRunMs, env); }
+
+// One line on stderr, "soundmeter: " in front, containing `part`.
+::testing::AssertionResult oneLine(const ProcessResult& r, const std::string& part) {
+    if (r.err.rfind("soundmeter: ", 0) == 0 && r.err.find('\n') == r.err.size() - 1 && r.err.find(part) != std::string::npos)
+        return ::testing::AssertionSuccess();
+    return ::testing::AssertionFailure() << "stderr: " << r.err;
 }
 
-size_t countLines(const std::string& text) {
-    size_t n = 0;
-    for (char c : text) n += c == '\n';
-    return n;
-}
-
-TEST(HostCli, HelpOfEveryCommandExitsZeroAndTellsThePlansReach) {
-    const std::vector<std::vector<std::string>> helps = {
-        {"--help"},          {"demo", "--help"},  {"listen", "--help"},  {"say", "--help"},
-        {"sweep", "--help"}, {"handshake", "-h"}, {"monitor", "--help"},
-    };
-    for (const auto& args : helps) {
-        ProcessResult r = run(args);
-        SCOPED_TRACE(args.front());
-        EXPECT_EQ(r.status, 0);
-        EXPECT_EQ(r.err, "");
-        EXPECT_NE(r.out.find("Usage: soundmeter"), std::string::npos) << r.out;
-        // Honest about what can be heard: 0..17 in reach, 18..22 masked, 23..39 beyond the bins.
-        EXPECT_NE(r.out.find("Only codes 0..17 (2580..17200 Hz)"), std::string::npos);
-        EXPECT_NE(r.out.find("codes 18..22 (18060..21500 Hz)"), std::string::npos);
-        EXPECT_NE(r.out.find("codes 23..39 (22360 Hz and up)"), std::string::npos);
+TEST(HostCli, HelpVersionAndBadUsage) {
+    for (const char* sub : {"demo", "listen", "say", "sweep", "handshake", "monitor", "devices"}) {
+        const ProcessResult r = run({sub, "--help"});
+        EXPECT_EQ(r.status, 0) << sub;
+        EXPECT_NE(r.out.find("Only codes 0..17 (2580..17200 Hz)"), std::string::npos) << sub;
     }
-    // The device commands take the routes; the demo makes its own room.
-    for (const char* sub : {"listen", "say", "sweep", "handshake", "monitor"}) {
-        ProcessResult r = run({sub, "--help"});
-        EXPECT_NE(r.out.find("--mic"), std::string::npos) << sub;
-        EXPECT_NE(r.out.find("--speaker"), std::string::npos) << sub;
-    }
-}
-
-TEST(HostCli, VersionIsOneLine) {
-    ProcessResult r = run({"--version"});
-    EXPECT_EQ(r.status, 0);
-    EXPECT_TRUE(std::regex_match(r.out, std::regex("soundmeter [0-9]+\\.[0-9]+\\.[0-9]+\n"))) << r.out;
-    EXPECT_EQ(r.err, "");
-}
-
-TEST(HostCli, BadUsageExitsTwoWithOneLineOnStderr) {
-    struct Case {
-        std::vector<std::string> args;
-        EnvList env;
-        std::string says;  // a part of the one line
+    EXPECT_TRUE(std::regex_match(run({"--version"}).out, std::regex("soundmeter [0-9]+\\.[0-9]+\\.[0-9]+\n")));
+    const std::pair<std::vector<std::string>, std::string> cases[] = {
+        {{}, "subcommand is required"},
+        {{"frobnicate"}, "unknown command 'frobnicate'"},
+        {{"say", "40"}, "CODE"},
+        {{"listen", "--mic", "bogus"}, "--mic: unknown audio route 'bogus'"},
+        {{"handshake", "--role", "speaker", "--first-code", "17"}, "--first-code"},  // its answer 18 is masked
+        {{"listen", "--seconds", "nan"}, "--seconds: 'nan' is not a number"},
+        {{"listen", "--seconds", "inf"}, "--seconds: 'inf' is not a number"},
+        {{"sweep", "--seconds", "-nan"}, "--seconds"},
+        {{"monitor", "--seconds", "-1"}, "--seconds"},
+        {{"demo", "--snr", "nan"}, "--snr: 'nan' is not a number"},
+        {{"demo", "--rounds", "0"}, "--rounds"},
+        {{"listen", "--level", "201"}, "--level"},
+        {{"handshake", "--role", "listener", "--level", "-101"}, "--level"},
+        {{"-q", "--json", "listen"}, "cannot be used together"},
     };
-    const std::vector<Case> cases = {
-        {{}, {}, "subcommand is required"},
-        {{"frobnicate"}, {}, "unknown command 'frobnicate'"},
-        {{"--frobnicate"}, {}, "unknown option '--frobnicate'"},
-        {{"say"}, {}, "CODE is required"},
-        {{"say", "40"}, {}, "CODE"},
-        {{"say", "3", "4"}, {}, "not expected: 4"},
-        {{"listen", "--mic", "bogus"}, {}, "--mic: unknown audio route 'bogus'"},
-        {{"say", "1", "--speaker", "wav:"}, {}, "--speaker"},
-        {{"listen", "--seconds", "1"}, {{"KORVO_MIC", "nowhere"}}, "KORVO_MIC: unknown audio route 'nowhere'"},
-        {{"demo", "--rounds", "-1"}, {}, "--rounds"},
-        {{"demo", "--rounds", "0"}, {}, "--rounds"},
-        {{"handshake", "--rounds", "2"}, {}, "--role is required"},
-        {{"handshake", "--role", "both"}, {}, "--role"},
-        {{"handshake", "--role", "speaker", "--rounds", "-3"}, {}, "--rounds"},
-        // With acknowledgement the answer to 17 would be 18, which cannot be heard.
-        {{"handshake", "--role", "speaker", "--first-code", "17"}, {}, "--first-code"},
-        {{"listen", "--code", "x"}, {}, "--code"},
-        {{"monitor", "--seconds", "-1"}, {}, "--seconds"},
-    };
-    for (const Case& c : cases) {
-        std::string shown;
-        for (const auto& a : c.args) shown += a + " ";
-        SCOPED_TRACE(shown);
-        ProcessResult r = run(c.args, c.env);
-        EXPECT_EQ(r.status, 2);
-        EXPECT_EQ(countLines(r.err), 1u) << r.err;
-        EXPECT_EQ(r.err.rfind("soundmeter: ", 0), 0u) << r.err;
-        EXPECT_NE(r.err.find(c.says), std::string::npos) << r.err;
+    for (const auto& [args, says] : cases) {
+        const ProcessResult r = run(args);
+        EXPECT_EQ(r.status, 2) << says;
+        EXPECT_TRUE(oneLine(r, says));
         EXPECT_EQ(r.out, "");
     }
+    const ProcessResult env = run({"listen"}, {{"KORVO_MIC", "nowhere"}});
+    EXPECT_TRUE(env.status == 2 && oneLine(env, "KORVO_MIC: unknown audio route 'nowhere'"));
+    const ProcessResult plugin = run({"listen", "--plugin=/nonexistent/lib.so"});
+    EXPECT_TRUE(plugin.status == 1 && oneLine(plugin, "cannot load the plug-in /nonexistent/lib.so"));
 }
 
-TEST(HostCli, MissingPlugInFailsWithOneLine) {
-    for (const EnvList& env : {EnvList{}, EnvList{{"KORVO_PLUGIN", "/nonexistent/libkorvo_soundmeter.so"}}}) {
-        std::vector<std::string> args = {"listen", "--seconds", "0.2"};
-        if (env.empty()) args.push_back("--plugin=/nonexistent/libkorvo_soundmeter.so");
-        ProcessResult r = run(args, env);
-        EXPECT_EQ(r.status, 1);
-        EXPECT_EQ(countLines(r.err), 1u) << r.err;
-        EXPECT_NE(r.err.find("cannot load the plug-in /nonexistent/libkorvo_soundmeter.so"), std::string::npos);
+TEST(HostCli, UnusableRoutesAreRefusedBeforeAnything) {
+    const std::string dir = "/tmp/korvo-cli-" + std::to_string(getpid());
+    ASSERT_EQ(mkdir(dir.c_str(), 0700), 0);
+    std::ofstream(dir + "/empty.wav").close();
+    std::ofstream(dir + "/garbage.wav") << "this is no sound file, only words";
+    const std::pair<std::vector<std::string>, std::string> cases[] = {
+        {{"say", "5", "--speaker", "wav:/proc/x.wav"}, "speaker wav:/proc/x.wav: cannot write"},
+        {{"say", "5", "--speaker", "wav:" + dir + "/no/x.wav"}, "speaker wav:" + dir + "/no/x.wav: cannot write"},
+        {{"say", "5", "--speaker", "wav:" + dir}, "Is a directory"},
+        {{"say", "5", "--speaker", "wav:/dev/full"}, "speaker wav:/dev/full: cannot write"},
+        {{"say", "5", "--speaker", "card:nosuch"}, "speaker card:nosuch: "},
+        {{"handshake", "--role", "speaker", "--no-ack", "--speaker", "wav:/proc/x.wav"}, "speaker wav:/proc/x.wav"},
+        {{"listen", "--mic", "wav:/nonexistent.wav", "--seconds", "3"}, "microphone wav:/nonexistent.wav: cannot"},
+        {{"listen", "--code", "5", "--mic", "wav:" + dir + "/empty.wav"}, "microphone wav:" + dir + "/empty.wav: "},
+        {{"monitor", "--mic", "wav:" + dir + "/garbage.wav"}, "microphone wav:" + dir + "/garbage.wav: "},
+        {{"listen", "--mic", "card:nosuch"}, "microphone card:nosuch: "},
+        {{"demo", "--speaker", "wav:/proc/x.wav"}, "speaker wav:/proc/x.wav"},
+    };
+    for (const auto& [args, says] : cases) {
+        const auto t0 = std::chrono::steady_clock::now();
+        const ProcessResult r = run(args);
+        EXPECT_EQ(r.status, 2) << says;
+        EXPECT_TRUE(oneLine(r, says));
+        EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(5)) << says;  // nothing waited out
+        EXPECT_EQ(r.out.find("said"), std::string::npos);
     }
-    // The demo's device fails the same way; the demo says so and fails too.
-    ProcessResult demo = run({"demo", "--plugin=/nonexistent/libkorvo_soundmeter.so"});
-    EXPECT_EQ(demo.status, 1);
-    EXPECT_NE(demo.err.find("soundmeter: cannot load the plug-in /nonexistent/libkorvo_soundmeter.so"),
-              std::string::npos);
-    EXPECT_NE(demo.err.find("soundmeter: a device failed (listener exit 1)\n"), std::string::npos) << demo.err;
-    EXPECT_NE(demo.out.find("0 of 3 exchanges completed\n"), std::string::npos) << demo.out;
+    const ProcessResult noise = run({"listen", "--mic", "sim:x"}, {{"KORVO_SIM_NOISE", "loud"}});
+    EXPECT_TRUE(noise.status == 2 && oneLine(noise, "microphone sim:x: KORVO_SIM_NOISE='loud' is not"));
+    EXPECT_EQ(system(("rm -r " + dir).c_str()), 0);
 }
 
-TEST(HostCli, PlatformLogAndPlugInOutputOnlyWithVerbose) {
-    // Quiet: neither the platform log nor the plug-in's own "Created"/"deleted" reach the user.
-    ProcessResult quiet = run({"listen", "--seconds", "0.3"}, {{"KORVO_LOG", ""}, {"KORVO_LOG_LEVEL", "D"}});
-    EXPECT_EQ(quiet.status, 0);
-    EXPECT_EQ(quiet.err, "");
-    EXPECT_TRUE(std::regex_match(quiet.out, std::regex("listening for every code\nlistened 0\\.[3-9] s: 0 codes\n")))
-        << quiet.out;
-
-    ProcessResult v = run({"-v", "listen", "--seconds", "0.3"});
-    EXPECT_EQ(v.status, 0);
-    EXPECT_NE(v.err.find("D/TQX: [SoundMeter] SoundMeter start!\n"), std::string::npos);
-    EXPECT_EQ(v.err.find("V/"), std::string::npos);  // -v stops at debug
-    EXPECT_NE(v.err.find("plug-in stdout: Created\n"), std::string::npos);
-    EXPECT_NE(v.err.find("plug-in stdout: deleted\n"), std::string::npos);
-    EXPECT_EQ(v.out.find("Created"), std::string::npos);
-
-    // The device comes up and goes down in the interface's order.
-    std::vector<std::string> order = {"[SoundMeter] makeToneGenerator", "[SoundMeter] start_wf_thread",
-                                      "[SoundMeter] end_wf_thread", "[SoundMeter] releaseToneGenerator"};
-    size_t at = 0;
-    for (const std::string& step : order) {
-        size_t found = v.err.find(step, at);
-        EXPECT_NE(found, std::string::npos) << step;
-        if (found != std::string::npos) at = found;
+TEST(HostCli, ARouteThatFailsWhileRunningEndsTheCommand) {
+    // The room is removed under a listening and a saying device: each ends within a second.
+    for (const std::vector<std::string>& args : {std::vector<std::string>{"listen", "--seconds", "30"},
+                                                std::vector<std::string>{"say", "3", "--ms", "30000"}}) {
+        const std::string room = uniqueRoom("gone");
+        HostProcess p(kHost);
+        std::vector<std::string> full = args;
+        full.insert(full.end(), {"--mic", "sim:" + room, "--speaker", "sim:" + room});
+        ASSERT_TRUE(p.start(full));
+        ASSERT_TRUE(p.waitForOutput("ing", 20000));
+        ASSERT_TRUE(waitFor([&] { return roomExists(room); }));
+        const auto removed = std::chrono::steady_clock::now();
+        unlink(("/dev/shm/korvo-" + std::to_string(geteuid()) + "/" + room).c_str());
+        const ProcessResult r = p.finish(kRunMs);
+        EXPECT_LT(std::chrono::steady_clock::now() - removed, std::chrono::milliseconds(1500)) << args[0];
+        EXPECT_EQ(r.status, 1) << args[0];
+        EXPECT_TRUE(oneLine(r, (args[0] == "say" ? "speaker sim:" : "microphone sim:") + room + ": the room was removed"));
     }
-    // -v after the subcommand works too.
-    ProcessResult v2 = run({"listen", "--seconds", "0.2", "-v"});
-    EXPECT_NE(v2.err.find("D/TQX: "), std::string::npos);
+}
+
+TEST(HostCli, CtrlCEndsEveryCommandWithOneLineAnd130) {
+    for (const std::vector<std::string>& args :
+         {std::vector<std::string>{"listen", "--seconds", "30"}, {"say", "3", "--ms", "20000"},
+          {"sweep", "--seconds", "30"}, {"monitor"}, {"handshake", "--role", "listener"}, {"demo", "--rounds", "100"}}) {
+        const std::string room = uniqueRoom("int");
+        std::vector<std::string> full = args;
+        if (args[0] != "demo") full.insert(full.end(), {"--mic", "sim:" + room, "--speaker", "sim:" + room});
+        HostProcess p(kHost);
+        ASSERT_TRUE(p.start(full));
+        const std::string sign = args[0] == "monitor" ? "heard:" : args[0] == "demo" ? "says" : args[0] == "handshake" ? "ready" : "ing";
+        ASSERT_TRUE(p.waitForOutput(sign, 20000)) << args[0];
+        p.sendSignal(SIGINT);
+        const ProcessResult r = p.finish(kRunMs);
+        EXPECT_EQ(r.status, 130) << args[0];
+        EXPECT_EQ(r.err, "soundmeter: interrupted\n") << args[0];
+        EXPECT_FALSE(roomExists(room));
+    }
+}
+
+TEST(HostCli, QuietAndJsonOutput) {
+    const std::string room = uniqueRoom("out");
+    const std::vector<std::string> routes = {"--mic", "sim:" + room, "--speaker", "sim:" + room};
+    HostProcess listener(kHost);
+    std::vector<std::string> args = {"--json", "listen", "--seconds", "30"};
+    args.insert(args.end(), routes.begin(), routes.end());
+    ASSERT_TRUE(listener.start(args));
+    ASSERT_TRUE(waitFor([&] { return roomExists(room); }, 20000));
+    std::vector<std::string> say = {"-q", "say", "4", "--ms", "600"};
+    say.insert(say.end(), routes.begin(), routes.end());
+    const ProcessResult said = run(say);
+    EXPECT_EQ(said.status, 0);
+    EXPECT_EQ(said.out, "said code 4 (6020 Hz)\n");  // -q: the result only
+    ASSERT_TRUE(listener.waitForOutput("\"heard\"", 20000));
+    listener.sendSignal(SIGINT);
+    const ProcessResult heard = listener.finish(kRunMs);
+    const nlohmann::json event = nlohmann::json::parse(linesOf(heard.out).at(0));
+    EXPECT_EQ(event["event"], "heard");
+    EXPECT_EQ(event["code"], 4);
+    EXPECT_EQ(event["hz"], 6020);
+    // Plurals agree, and a null speaker says once that nothing is audible.
+    const ProcessResult one = run({"say", "1", "--ms", "50"});
+    EXPECT_EQ(one.status, 0);
+    EXPECT_TRUE(oneLine(one, "note: the speaker route is null, so nothing is audible; add --speaker card"));
+    EXPECT_NE(run({"listen", "--seconds", "0.3"}).out.find(": 0 codes\n"), std::string::npos);
 }
 
 }  // namespace

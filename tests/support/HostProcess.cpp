@@ -1,6 +1,5 @@
 #include "support/HostProcess.h"
 
-#include <dirent.h>
 #include <signal.h>
 #include <unistd.h>
 
@@ -13,12 +12,13 @@ namespace testing {
 
 using host::monotonicMs;
 
-bool HostProcess::start(const std::vector<std::string>& args, const EnvList& env) {
+bool HostProcess::start(const std::vector<std::string>& args, const EnvList& env, int userId) {
     std::vector<std::string> argv = {mProgram};
     argv.insert(argv.end(), args.begin(), args.end());
     host::ChildProcess::Options options;
     options.captureStderr = true;
     options.nullStdin = true;
+    options.userId = userId;
     return mChild.start(mProgram, argv, env, options, nullptr);
 }
 
@@ -52,9 +52,9 @@ ProcessResult HostProcess::finish(int timeoutMs) {
 }
 
 ProcessResult runHost(const std::string& program, const std::vector<std::string>& args, int timeoutMs,
-                      const EnvList& env) {
+                      const EnvList& env, int userId) {
     HostProcess p(program);
-    if (!p.start(args, env)) return ProcessResult{};
+    if (!p.start(args, env, userId)) return ProcessResult{};
     return p.finish(timeoutMs);
 }
 
@@ -71,17 +71,7 @@ std::string uniqueRoom(const std::string& tag) {
 }
 
 bool roomExists(const std::string& room) {
-    DIR* dir = opendir("/dev/shm");
-    if (dir == nullptr) return false;
-    bool found = false;
-    const std::string suffix = "-" + room;
-    while (dirent* e = readdir(dir)) {
-        std::string name = e->d_name;
-        if (name.size() >= suffix.size() && name.compare(name.size() - suffix.size(), suffix.size(), suffix) == 0)
-            found = true;
-    }
-    closedir(dir);
-    return found;
+    return access(("/dev/shm/korvo-" + std::to_string(geteuid()) + "/" + room).c_str(), F_OK) == 0;
 }
 
 }  // namespace testing

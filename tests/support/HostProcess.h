@@ -22,7 +22,7 @@ class HostProcess {
 public:
     explicit HostProcess(std::string program) : mProgram(std::move(program)) {}
     // Runs the program with the arguments (without argv[0]); stdin is /dev/null.
-    bool start(const std::vector<std::string>& args, const EnvList& env = {});
+    bool start(const std::vector<std::string>& args, const EnvList& env = {}, int userId = -1);
     // Collects output until stdout holds `text` or the time is up.
     bool waitForOutput(const std::string& text, int timeoutMs);
     void sendSignal(int sig) { mChild.sendSignal(sig); }
@@ -36,7 +36,7 @@ private:
 
 // Runs the program to its end, killing it after timeoutMs.
 ProcessResult runHost(const std::string& program, const std::vector<std::string>& args, int timeoutMs,
-                      const EnvList& env = {});
+                      const EnvList& env = {}, int userId = -1);
 
 // Lines of a text (without their line ends).
 std::vector<std::string> linesOf(const std::string& text);

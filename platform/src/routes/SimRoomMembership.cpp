@@ -292,11 +292,10 @@ RoomMembership::~RoomMembership() {
     lockFile(mFd);
     if (mMember >= 0) mLayout->header.members[mMember].store(0, std::memory_order_release);
     if (mSlot >= 0) mLayout->slots[mSlot].owner.store(0, std::memory_order_release);
-    const bool last = forgetDeparted(*mLayout) == 0 && stillNamed(mFd, mObjectName);
-    if (last) unlink(mObjectName.c_str());
+    if (forgetDeparted(*mLayout) == 0 && stillNamed(mFd, mObjectName)) unlink(mObjectName.c_str());
     unmapLayout(mLayout);
     close(mFd);  // drops the lock
-    if (last) dropFolderIfEmpty();
+    dropFolderIfEmpty();  // also when the room was removed under this member
 }
 
 bool RoomMembership::stillThere() const { return stillNamed(mFd, mObjectName); }
