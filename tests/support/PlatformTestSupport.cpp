@@ -1,21 +1,14 @@
 #include "support/PlatformTestSupport.h"
 
-#include <fcntl.h>
-#include <poll.h>
 #include <signal.h>
 #include <sndfile.h>
-#include <spawn.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <cstdlib>
-#include <cstring>
 #include <fstream>
 #include <sstream>
 #include <thread>
-
-extern char** environ;
 
 namespace korvo {
 namespace platformtest {
@@ -99,69 +92,29 @@ bool writeWav(const std::string& path, int rate, int channels, const std::vector
 }
 
 Child::Child(const std::map<std::string, std::string>& vars) {
-    int fds[2];
-    if (pipe2(fds, O_CLOEXEC) != 0) return;
-    std::vector<std::string> env;
-    for (char** e = environ; *e; ++e) {
-        if (std::strncmp(*e, "KORVO_SIM", 9) && std::strncmp(*e, "KORVO_LOG", 9) && std::strncmp(*e, "GTEST_", 6)) {
-            env.emplace_back(*e);
-        }
-    }
-    for (const auto& kv : vars) env.push_back(kv.first + "=" + kv.second);
-    std::vector<char*> envp;
-    for (auto& s : env) envp.push_back(s.data());
-    envp.push_back(nullptr);
-    char self[4096] = {};
-    if (readlink("/proc/self/exe", self, sizeof self - 1) > 0) {
-        char* argv[] = {self, nullptr};
-        posix_spawn_file_actions_t actions;
-        posix_spawn_file_actions_init(&actions);
-        posix_spawn_file_actions_adddup2(&actions, fds[1], STDOUT_FILENO);
-        if (posix_spawn(&mPid, self, &actions, nullptr, argv, envp.data()) != 0) mPid = -1;
-        posix_spawn_file_actions_destroy(&actions);
-    }
-    close(fds[1]);
-    mOut = fds[0];
-}
-
-Child::~Child() {
-    if (mPid > 0) killNow();
-    if (mOut >= 0) close(mOut);
+    // The parent's room and log settings are left out (an empty value removes a variable).
+    host::EnvList env = {{"KORVO_SIM_GAIN", ""}, {"KORVO_SIM_NOISE", ""}, {"KORVO_SIM_SEED", ""},
+                         {"KORVO_LOG", ""},      {"KORVO_LOG_LEVEL", ""}};
+    env.insert(env.end(), vars.begin(), vars.end());
+    std::string error;
+    if (!mProcess.start(host::selfExecutable(), {"child"}, env, {false, true}, &error)) ADD_FAILURE() << error;
 }
 
 bool Child::waitReady(int timeoutMs) {
-    const auto deadline = Clock::now() + std::chrono::milliseconds(timeoutMs);
-    std::string got;
-    while (got.find("ready\n") == std::string::npos) {
-        const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now());
-        if (left.count() <= 0) return false;
-        pollfd p{mOut, POLLIN, 0};
-        if (poll(&p, 1, int(left.count())) <= 0) continue;
-        char buf[64];
-        const ssize_t n = read(mOut, buf, sizeof buf);
-        if (n <= 0) return false;
-        got.append(buf, size_t(n));
-    }
-    return true;
+    const auto ready = [&] { return mProcess.out().find("ready\n") != std::string::npos; };
+    return waitUntil([&] { return !mProcess.pump(10) || ready(); }, timeoutMs) && ready();
 }
 
 int Child::waitExit(int timeoutMs) {
-    if (mPid <= 0) return -2;
-    const auto deadline = Clock::now() + std::chrono::milliseconds(timeoutMs);
     int status = 0;
-    while (waitpid(mPid, &status, WNOHANG) == 0) {
-        if (Clock::now() > deadline) return -1;
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
-    mPid = -1;
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -2;
+    if (!mProcess.wait(timeoutMs, &status)) return -1;
+    return status >= 128 ? -2 : status;
 }
 
 void Child::killNow() {
-    if (mPid <= 0) return;
-    kill(mPid, SIGKILL);
-    waitpid(mPid, nullptr, 0);
-    mPid = -1;
+    mProcess.sendSignal(SIGKILL);
+    int status = 0;
+    mProcess.wait(5000, &status);
 }
 
 }  // namespace platformtest

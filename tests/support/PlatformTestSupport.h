@@ -17,6 +17,8 @@
 
 #include <korvo/platform/TestControl.h>
 
+#include "host/ChildProcess.h"
+
 namespace korvo {
 namespace platformtest {
 
@@ -61,15 +63,12 @@ Wav readWav(const std::string& path);
 bool writeWav(const std::string& path, int rate, int channels, const std::vector<int16_t>& samples);
 
 // This test binary started again with `vars` added to the environment (the parent's
-// KORVO_SIM*, KORVO_LOG* and GTEST_* variables left out); its stdout is a pipe to us.
-// The child is killed if still running when this goes.
+// room and log settings left out); its stdout is a pipe to us. The child is killed if
+// still running when this goes.
 class Child {
 public:
     explicit Child(const std::map<std::string, std::string>& vars);
-    Child(const Child&) = delete;
-    Child& operator=(const Child&) = delete;
-    ~Child();
-    bool started() const { return mPid > 0; }
+    bool started() const { return mProcess.running(); }
     // Waits (bounded) for a "ready\n" line on the child's stdout.
     bool waitReady(int timeoutMs = 15000);
     // Exit code; -1 when it did not end in time, -2 when it did not exit normally.
@@ -77,8 +76,7 @@ public:
     void killNow();
 
 private:
-    pid_t mPid = -1;
-    int mOut = -1;
+    host::ChildProcess mProcess;
 };
 
 // Every test starts and ends with the test-control settings at their defaults and starts
