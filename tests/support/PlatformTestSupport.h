@@ -1,21 +1,19 @@
-// Helpers shared by the platform tests: a fixture, bounded waits, temporary files, scoped
-// environment variables, WAV files and re-runs of the test binary as a child.
+// Shared by the platform tests: one fixture, bounded waits, files, and this test binary
+// run again as a child process.
 #pragma once
-#include <sys/types.h>
+#include <signal.h>
 
-#include <atomic>
-#include <chrono>
 #include <cstdint>
 #include <functional>
-#include <map>
-#include <memory>
+#include <utility>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include <gtest/gtest.h>
 
 #include <korvo/platform/TestControl.h>
+
+#include "host/ChildProcess.h"
 
 namespace korvo {
 namespace platformtest {
@@ -24,76 +22,34 @@ namespace test = korvo::platform::test;
 
 // Polls `pred` until it holds; false when `timeoutMs` ran out first.
 bool waitUntil(const std::function<bool()>& pred, int timeoutMs = 5000);
-
 std::string readFile(const std::string& path);
+// A 16-bit mono WAV file's samples as an independent reader sees them (empty when unreadable).
+std::vector<int16_t> readWav(const std::string& path, int* rate);
 
-// Paths under /tmp private to this process; each is removed when handed out and at the end.
-class TempFiles {
+// This test binary run again with `env` changed (an empty value removes a variable); it
+// takes its role from a static initialiser and exits before any test runs.
+class Child : public host::ChildProcess {
 public:
-    explicit TempFiles(std::string prefix) : mPrefix(std::move(prefix)) {}
-    ~TempFiles();
-    std::string path(const std::string& name);
-
-private:
-    std::string mPrefix;
-    std::vector<std::string> mPaths;
+    explicit Child(const host::EnvList& env, bool captureStderr = false);
+    bool waitReady(int timeoutMs = 15000);  // a "ready" line on its stdout
+    int waitExit(int timeoutMs = 20000);     // reads its output to the end; exit status, -1 on timeout
+    void kill() {
+        sendSignal(SIGKILL);
+        waitExit();
+    }
 };
 
-// Sets (or, with nullptr, unsets) variables; the old values come back on restore() or at the end.
-class EnvGuard {
-public:
-    ~EnvGuard() { restore(); }
-    void set(const char* name, const char* value);
-    void restore();
-
-private:
-    std::map<std::string, std::unique_ptr<std::string>> mSaved;
-};
-
-struct Wav {
-    bool ok = false;
-    int rate = 0, channels = 0, format = 0;
-    int64_t frames = 0;
-    std::vector<int16_t> samples;  // interleaved
-};
-Wav readWav(const std::string& path);
-// 16-bit WAV of interleaved samples; false when it could not be written whole.
-bool writeWav(const std::string& path, int rate, int channels, const std::vector<int16_t>& samples);
-
-// This test binary started again with `vars` added to the environment (the parent's
-// KORVO_SIM*, KORVO_LOG* and GTEST_* variables left out); its stdout is a pipe to us.
-// The child is killed if still running when this goes.
-class Child {
-public:
-    explicit Child(const std::map<std::string, std::string>& vars);
-    Child(const Child&) = delete;
-    Child& operator=(const Child&) = delete;
-    ~Child();
-    bool started() const { return mPid > 0; }
-    // Waits (bounded) for a "ready\n" line on the child's stdout.
-    bool waitReady(int timeoutMs = 15000);
-    // Exit code; -1 when it did not end in time, -2 when it did not exit normally.
-    int waitExit(int timeoutMs = 20000);
-    void killNow();
-
-private:
-    pid_t mPid = -1;
-    int mOut = -1;
-};
-
-// Every test starts and ends with the test-control settings at their defaults and starts
-// with the null routes in force; the environment and the temporary files it changed are
-// put back after it.
+// Every test starts with the test controls at their defaults and no route, log or room
+// variable set; after it they, the log configuration and the files it named are put back.
 class PlatformFixture : public ::testing::Test {
 protected:
-    void SetUp() override {
-        test::resetAll();
-        mEnv.set("KORVO_MIC", nullptr);
-        mEnv.set("KORVO_SPEAKER", nullptr);
-    }
-    void TearDown() override { test::resetAll(); }
-    EnvGuard mEnv;
-    TempFiles mFiles{"korvo-platform-test"};
+    void SetUp() override;
+    void TearDown() override;
+    std::string tempPath(const std::string& name);  // under /tmp, removed after the test
+
+private:
+    std::vector<std::pair<std::string, std::string>> mSavedEnv;  // the variables that were set
+    std::vector<std::string> mPaths;
 };
 
 }  // namespace platformtest
