@@ -10,6 +10,8 @@
 #include "capture/CaptureLoop.h"
 #include "capture/FrameExchange.h"
 #include "interface/LogTags.h"
+
+using korvo::kRingSlots;
 #include "meter/SoundMeter.h"
 
 namespace korvo {
@@ -74,7 +76,7 @@ void SoundMeter::processAudio() {
         const float level = static_cast<float>(korvo::levelOf(target, n));
         int16_t copy[sizeof(pcmRing) / sizeof(pcmRing[0])];
         memcpy(copy, pcmRing, sizeof(copy));
-        korvo::publishFrame(slot % korvo::kRingSlots, level, copy, n);
+        korvo::publishFrame(slot % kRingSlots, level, copy, n);
 
         const int64_t w = korvo::captureWaitNs(sleep, systemTime(SYSTEM_TIME_MONOTONIC) - t0);
         struct timespec now;
@@ -86,6 +88,6 @@ void SoundMeter::processAudio() {
     pthread_mutex_unlock(&AudioBufferLock);
 
     if (complete) {
-        ringIndex.store((slot + 1) % korvo::kRingSlots, std::memory_order_relaxed);
+        ringIndex.store((slot + 1) % kRingSlots, std::memory_order_relaxed);
     }
 }
