@@ -395,7 +395,7 @@ std::string uniqueRoom(const std::string& tag) {
     return "t" + std::to_string(getpid()) + "-" + tag + "-" + std::to_string(++counter);
 }
 
-std::string roomFile(const std::string& room) { return "/dev/shm/korvo-room-" + std::to_string(geteuid()) + "-" + room; }
+std::string roomFile(const std::string& room) { return "/dev/shm/korvo-" + std::to_string(geteuid()) + "/" + room; }
 
 std::map<int, size_t> histogram(const Samples& x) {
     std::map<int, size_t> counts;
