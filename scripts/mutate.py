@@ -688,9 +688,9 @@ def failed_tests(out):
     return FAILED_RE.findall(tail_part[1])
 
 
-def tail(out, n=30):
-    for line in out.rstrip().splitlines()[-n:]:
-        print("    " + line)
+def tail(text, out=None, n=30):
+    for line in text.rstrip().splitlines()[-n:]:
+        (out.line if out else print)("    " + line)
 
 
 # ---------------------------------------------------------------------------
@@ -811,25 +811,24 @@ def run_mutant(runner, backup, site, rel, lineno):
             signal.pthread_sigmask(signal.SIG_SETMASK, old)
 
 
-def baseline(runner):
+def baseline(runner, out):
     t0 = time.time()
-    print("baseline: building %s" % runner.build, flush=True)
-    rc, out = runner.build_all()
+    out.line("baseline: building %s" % runner.build)
+    rc, text = runner.build_all()
     if rc != 0:
-        tail(out)
-        print("baseline: the unmutated tree does not build; stopping")
+        tail(text, out)
+        out.line("baseline: the unmutated tree does not build; stopping")
         sys.exit(2)
-    print("baseline: running the suite", flush=True)
-    rc, out = runner.ctest()
+    out.line("baseline: running the suite")
+    rc, text = runner.ctest()
     if rc == 0:
-        m = re.search(r"tests passed, 0 tests failed out of (\d+)", out)
-        print("baseline: green, %s tests (%.0f s)" % (m.group(1) if m else "all", time.time() - t0),
-              flush=True)
+        m = re.search(r"tests passed, 0 tests failed out of (\d+)", text)
+        out.line("baseline: green, %s tests (%.0f s)" % (m.group(1) if m else "all", time.time() - t0))
         return
-    tail(out)
-    failed = [n for n, _ in failed_tests(out)]
+    tail(text, out)
+    failed = [n for n, _ in failed_tests(text)]
     if rc is None or not failed:
-        print("baseline: the suite did not complete; stopping")
+        out.line("baseline: the suite did not complete; stopping")
         sys.exit(2)
     flaky = []
     for _ in range(2):
@@ -839,11 +838,11 @@ def baseline(runner):
         if flaky:
             break
     if flaky:
-        print("baseline: flaky tests (failed, then passed unchanged): " + ", ".join(flaky))
+        out.line("baseline: flaky tests (failed, then passed unchanged): " + ", ".join(flaky))
     steady = [n for n in failed if n not in flaky]
     if steady:
-        print("baseline: failing tests: " + ", ".join(steady))
-    print("baseline: the unmutated suite is not green; stopping")
+        out.line("baseline: failing tests: " + ", ".join(steady))
+    out.line("baseline: the unmutated suite is not green; stopping")
     sys.exit(2)
 
 
@@ -947,7 +946,7 @@ def main():
         if not private:
             out.line("mutate: tests run in the ordinary /tmp and /dev/shm")
         runner.configure()
-        baseline(runner)
+        baseline(runner, out)
         width = len(str(len(sites)))
         for i, (s, where) in enumerate(zip(sites, placed), 1):
             t0 = time.time()
