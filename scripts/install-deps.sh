@@ -6,6 +6,9 @@ packages=(
   g++ cmake make pkg-config binutils
   libgtest-dev libgmock-dev libbenchmark-dev
   libsndfile1-dev portaudio19-dev libcli11-dev libfftw3-dev
+  libsamplerate0-dev
+  # the recording tests make their files with sox; its base formats hold FLAC and Ogg
+  sox libsox-fmt-base
 )
 
 missing=()

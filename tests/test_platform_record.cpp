@@ -95,7 +95,7 @@ TEST_F(RecordTest, ConfigurationAndBadRoutes) {
     test::clearLog();
     EXPECT_EQ(makeRecord()->initCheck(), NO_INIT);
     ASSERT_EQ(test::logLines().size(), 1u);
-    EXPECT_NE(test::logLines()[0].msg.find("cannot read WAV file"), std::string::npos);
+    EXPECT_NE(test::logLines()[0].msg.find("cannot open: No such file or directory"), std::string::npos);
 }
 
 TEST_F(RecordTest, ScriptedMicrophone) {
@@ -250,27 +250,20 @@ TEST_F(RecordTest, WavFileHeardThroughTheStream) {
     for (size_t i = 3000; i < 4000; ++i) ASSERT_EQ(heard[i], 0) << i;  // then silence
     EXPECT_TRUE(test::logLines().empty());
 
-    // Another rate and two channels: the first channel is heard, each difference logged once.
+    // Two channels are mixed into one and another rate converted to the stream's, quietly:
+    // 10 ms of a constant at 48 kHz are heard as 441 samples of their mean.
     const std::string stereoPath = mFiles.path("stereo48k.wav");
-    std::vector<int16_t> frames(2 * 500, -1);
-    for (size_t i = 0; i < 500; ++i) frames[2 * i] = static_cast<int16_t>(i * 13);
+    std::vector<int16_t> frames(2 * 480);
+    for (size_t i = 0; i < 480; ++i) frames[2 * i] = 8000, frames[2 * i + 1] = 4000;
     ASSERT_TRUE(writeWav(stereoPath, 48000, 2, frames));
     setenv("KORVO_MIC", ("wav:" + stereoPath).c_str(), 1);
     sp<AudioRecord> stereo = makeRecord();
     ASSERT_EQ(stereo->start(), OK);
     std::fill(heard.begin(), heard.end(), 1);
     ASSERT_EQ(stereo->read(heard.data(), 1200, true), 1200);
-    for (size_t i = 0; i < 500; ++i) ASSERT_EQ(heard[i], static_cast<int16_t>(i * 13)) << i;
-    for (size_t i = 500; i < 600; ++i) ASSERT_EQ(heard[i], 0);
-    const auto lines = test::logLines();
-    int rateLines = 0;
-    for (const auto& l : lines) {
-        EXPECT_EQ(l.prio, ANDROID_LOG_ERROR);
-        EXPECT_EQ(l.msg.find('\n'), std::string::npos);
-        rateLines += l.msg.find("48000 Hz") != std::string::npos && l.msg.find("rate differs") != std::string::npos;
-    }
-    EXPECT_EQ(rateLines, 1);
-    EXPECT_EQ(lines.size(), 2u);  // the rate, and the channels
+    for (size_t i = 100; i < 340; ++i) ASSERT_NEAR(heard[i], 6000, 120) << i;
+    for (size_t i = 520; i < 600; ++i) ASSERT_NEAR(heard[i], 0, 60) << i;
+    EXPECT_TRUE(test::logLines().empty());
 }
 
 }  // namespace
