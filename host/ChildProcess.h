@@ -19,6 +19,7 @@ public:
     struct Options {
         bool captureStderr = false;  // else stderr is shared with the parent
         bool nullStdin = false;      // else stdin is shared with the parent
+        std::string stdinFile;       // when set, stdin reads this file instead
     };
 
     ChildProcess() = default;

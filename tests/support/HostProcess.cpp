@@ -13,12 +13,13 @@ namespace testing {
 
 using host::monotonicMs;
 
-bool HostProcess::start(const std::vector<std::string>& args, const EnvList& env) {
+bool HostProcess::start(const std::vector<std::string>& args, const EnvList& env, const std::string& stdinFile) {
     std::vector<std::string> argv = {mProgram};
     argv.insert(argv.end(), args.begin(), args.end());
     host::ChildProcess::Options options;
     options.captureStderr = true;
     options.nullStdin = true;
+    options.stdinFile = stdinFile;
     return mChild.start(mProgram, argv, env, options, nullptr);
 }
 
@@ -52,9 +53,9 @@ ProcessResult HostProcess::finish(int timeoutMs) {
 }
 
 ProcessResult runHost(const std::string& program, const std::vector<std::string>& args, int timeoutMs,
-                      const EnvList& env) {
+                      const EnvList& env, const std::string& stdinFile) {
     HostProcess p(program);
-    if (!p.start(args, env)) return ProcessResult{};
+    if (!p.start(args, env, stdinFile)) return ProcessResult{};
     return p.finish(timeoutMs);
 }
 

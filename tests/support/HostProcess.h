@@ -21,8 +21,9 @@ struct ProcessResult {
 class HostProcess {
 public:
     explicit HostProcess(std::string program) : mProgram(std::move(program)) {}
-    // Runs the program with the arguments (without argv[0]); stdin is /dev/null.
-    bool start(const std::vector<std::string>& args, const EnvList& env = {});
+    // Runs the program with the arguments (without argv[0]); stdin is /dev/null, or the
+    // file stdinFile when given.
+    bool start(const std::vector<std::string>& args, const EnvList& env = {}, const std::string& stdinFile = "");
     // Collects output until stdout holds `text` or the time is up.
     bool waitForOutput(const std::string& text, int timeoutMs);
     void sendSignal(int sig) { mChild.sendSignal(sig); }
@@ -36,7 +37,7 @@ private:
 
 // Runs the program to its end, killing it after timeoutMs.
 ProcessResult runHost(const std::string& program, const std::vector<std::string>& args, int timeoutMs,
-                      const EnvList& env = {});
+                      const EnvList& env = {}, const std::string& stdinFile = "");
 
 // Lines of a text (without their line ends).
 std::vector<std::string> linesOf(const std::string& text);
