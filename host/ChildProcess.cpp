@@ -59,6 +59,14 @@ bool ChildProcess::start(const std::string& path, const std::vector<std::string>
     for (std::string& s : argText) argv.push_back(&s[0]);
     argv.push_back(nullptr);
 
+    int input = -1;
+    if (!options.stdinFile.empty()) {
+        input = open(options.stdinFile.c_str(), O_RDONLY | O_CLOEXEC);
+        if (input < 0) {
+            if (error) *error = "cannot open " + options.stdinFile + ": " + strerror(errno);
+            return false;
+        }
+    }
     int pipes[2][2] = {{-1, -1}, {-1, -1}};
     const int count = options.captureStderr ? 2 : 1;
     for (int i = 0; i < count; ++i) {
@@ -69,6 +77,7 @@ bool ChildProcess::start(const std::string& path, const std::vector<std::string>
                     if (fd >= 0) close(fd);
                 }
             }
+            if (input >= 0) close(input);
             return false;
         }
     }
@@ -81,7 +90,9 @@ bool ChildProcess::start(const std::string& path, const std::vector<std::string>
         if (options.userId >= 0 && (setgid(gid_t(options.userId)) != 0 || setuid(uid_t(options.userId)) != 0)) _exit(126);
         dup2(pipes[0][1], STDOUT_FILENO);     // dup2 clears close-on-exec on the copy
         if (count == 2) dup2(pipes[1][1], STDERR_FILENO);
-        if (options.nullStdin) {
+        if (input >= 0) {
+            dup2(input, STDIN_FILENO);
+        } else if (options.nullStdin) {
             int devnull = open("/dev/null", O_RDONLY);
             if (devnull >= 0) dup2(devnull, STDIN_FILENO);
         }
@@ -89,6 +100,7 @@ bool ChildProcess::start(const std::string& path, const std::vector<std::string>
         _exit(127);
     }
     for (int i = 0; i < count; ++i) close(pipes[i][1]);
+    if (input >= 0) close(input);
     if (pid < 0) {
         if (error) *error = std::string("cannot fork: ") + strerror(errno);
         for (int i = 0; i < count; ++i) close(pipes[i][0]);

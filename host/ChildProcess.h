@@ -21,6 +21,7 @@ public:
         bool nullStdin = false;      // else stdin is shared with the parent
         bool ownGroup = false;       // a process group of its own: the terminal's Ctrl-C reaches only the parent
         int userId = -1;             // run as this user (and its group), when the parent may
+        std::string stdinFile;       // when set, stdin reads this file instead
     };
 
     ChildProcess() = default;

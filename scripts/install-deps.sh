@@ -8,6 +8,9 @@ packages=(
   g++ cmake make pkg-config binutils
   libgtest-dev libgmock-dev libbenchmark-dev nlohmann-json3-dev
   libsndfile1-dev portaudio19-dev libcli11-dev libfftw3-dev
+  libsamplerate0-dev
+  # the recording tests make their files with sox; its base formats hold FLAC and Ogg
+  sox libsox-fmt-base
 )
 for preset in "$@"; do
   if [ "$preset" = clang ]; then packages+=(clang); fi

@@ -85,7 +85,7 @@ TEST(HostDemo, ARoomFolderHeldByAnotherUserIsAnUnusableRoute) {
     // Another user (here root) made nobody's room folder first.
     const std::string folder = "/dev/shm/korvo-65534";
     ASSERT_EQ(mkdir(folder.c_str(), 0700), 0) << folder << " exists already";
-    const ProcessResult r = runHost(kHost, {"listen", "--mic", "sim:lab", "--seconds", "5"}, kRunMs, {}, 65534);
+    const ProcessResult r = runHost(kHost, {"listen", "--mic", "sim:lab", "--seconds", "5"}, kRunMs, {}, "", 65534);
     rmdir(folder.c_str());
     EXPECT_EQ(r.status, 2) << r.err;
     EXPECT_EQ(r.err, "soundmeter: microphone sim:lab: the room folder " + folder + " belongs to another user\n");

@@ -12,13 +12,15 @@ namespace testing {
 
 using host::monotonicMs;
 
-bool HostProcess::start(const std::vector<std::string>& args, const EnvList& env, int userId) {
+bool HostProcess::start(const std::vector<std::string>& args, const EnvList& env, const std::string& stdinFile,
+                        int userId) {
     std::vector<std::string> argv = {mProgram};
     argv.insert(argv.end(), args.begin(), args.end());
     host::ChildProcess::Options options;
     options.captureStderr = true;
     options.nullStdin = true;
     options.userId = userId;
+    options.stdinFile = stdinFile;
     return mChild.start(mProgram, argv, env, options, nullptr);
 }
 
@@ -52,9 +54,9 @@ ProcessResult HostProcess::finish(int timeoutMs) {
 }
 
 ProcessResult runHost(const std::string& program, const std::vector<std::string>& args, int timeoutMs,
-                      const EnvList& env, int userId) {
+                      const EnvList& env, const std::string& stdinFile, int userId) {
     HostProcess p(program);
-    if (!p.start(args, env, userId)) return ProcessResult{};
+    if (!p.start(args, env, stdinFile, userId)) return ProcessResult{};
     return p.finish(timeoutMs);
 }
 

@@ -21,8 +21,10 @@ struct ProcessResult {
 class HostProcess {
 public:
     explicit HostProcess(std::string program) : mProgram(std::move(program)) {}
-    // Runs the program with the arguments (without argv[0]); stdin is /dev/null.
-    bool start(const std::vector<std::string>& args, const EnvList& env = {}, int userId = -1);
+    // Runs the program with the arguments (without argv[0]); stdin is /dev/null, or the
+    // file stdinFile when given; as another user when userId is set.
+    bool start(const std::vector<std::string>& args, const EnvList& env = {}, const std::string& stdinFile = "",
+               int userId = -1);
     // Collects output until stdout holds `text` or the time is up.
     bool waitForOutput(const std::string& text, int timeoutMs);
     void sendSignal(int sig) { mChild.sendSignal(sig); }
@@ -36,7 +38,7 @@ private:
 
 // Runs the program to its end, killing it after timeoutMs.
 ProcessResult runHost(const std::string& program, const std::vector<std::string>& args, int timeoutMs,
-                      const EnvList& env = {}, int userId = -1);
+                      const EnvList& env = {}, const std::string& stdinFile = "", int userId = -1);
 
 // Lines of a text (without their line ends).
 std::vector<std::string> linesOf(const std::string& text);

@@ -1,212 +1,138 @@
-// The wav route: a WAV file's samples as the microphone, or a WAV file that keeps every
-// sample written to the loudspeaker. Both at real-time pace.
-#include <sndfile.h>
-
-#include <sys/stat.h>
-#include <unistd.h>
-
+// The wav route as a microphone: a recording's samples, mixed down to mono and converted
+// to the stream's rate, at the real-time pace of a microphone; after the file, silence.
 #include <algorithm>
-#include <cerrno>
-#include <cstring>
+#include <cmath>
 #include <mutex>
 #include <vector>
 
-#include <log/log.h>
 #include <utils/Errors.h>
 
 #include "routes/Pacer.h"
+#include "routes/ResampledInput.h"
 #include "routes/RouteFactories.h"
+#include "routes/SoundFileInput.h"
 
 namespace korvo {
 namespace platform {
 
 namespace {
 
-constexpr const char* kTag = "WavRoute";
-constexpr uint32_t kDefaultRate = 44100;
-constexpr sf_count_t kChunkFrames = 1024;
+constexpr long kDecodeBlock = 1024;
+
+int16_t toPcm16(float v) {
+    return static_cast<int16_t>(std::lrint(std::clamp(v * 32768.0f, -32768.0f, 32767.0f)));
+}
 
 class WavCaptureRoute : public CaptureRoute {
 public:
-    WavCaptureRoute(std::string path, SNDFILE* file, const SF_INFO& info)
-        : mPath(std::move(path)), mFile(file), mInfo(info),
-          mScratch(static_cast<size_t>(kChunkFrames * info.channels)) {
-        if (mInfo.channels > 1) {
-            __android_log_print(ANDROID_LOG_ERROR, kTag, "wav:%s has %d channels: only the first is heard",
-                                mPath.c_str(), mInfo.channels);
-        }
+    explicit WavCaptureRoute(std::unique_ptr<SoundFileInput> input)
+        : mInput(std::move(input)), mConverted(*mInput), mBlock(kDecodeBlock) {
+        mProgress.finite = true;
+        mProgress.totalSeconds = static_cast<double>(mInput->frames()) / mInput->rate();
     }
-    ~WavCaptureRoute() override { sf_close(mFile); }
 
     int open(uint32_t sampleRate) override {
-        if (sampleRate == 0) return android::BAD_VALUE;
-        if (static_cast<uint32_t>(mInfo.samplerate) != sampleRate) {
-            // No resampling: the samples are heard as they are, at the stream's rate.
-            __android_log_print(ANDROID_LOG_ERROR, kTag,
-                                "wav:%s is at %d Hz, the stream at %u Hz: the rate differs",
-                                mPath.c_str(), mInfo.samplerate, sampleRate);
+        std::string cause;
+        if (sampleRate == 0) {
+            cause = "cannot open: no sample rate";
+        } else if (mConverted.setRate(sampleRate, &cause)) {
+            mRate = sampleRate;
+            mPacing.start(sampleRate);
+            return 0;
         }
-        mPacing.start(sampleRate);
-        mOpened = true;
-        return 0;
+        fail(cause);
+        return android::BAD_VALUE;
     }
 
     ssize_t read(int16_t* out, size_t count) override {
-        if (!mOpened) return android::NO_INIT;
-        const size_t n = mPacing.next(count);
-        size_t done = 0;
-        while (done < n && !mAtEnd) {
-            const sf_count_t want = std::min<sf_count_t>(kChunkFrames, static_cast<sf_count_t>(n - done));
-            const sf_count_t got = sf_readf_short(mFile, mScratch.data(), want);
-            if (got <= 0) {
-                mAtEnd = true;  // after the file: silence
-                break;
+        if (mRate == 0) return android::NO_INIT;
+        if (mFailed) return android::UNKNOWN_ERROR;
+        // Decoded before the wait, so that a broken file fails at once.
+        while (mPending.size() - mHead < count && !mEnded) {
+            std::string cause;
+            const long got = mConverted.read(mBlock.data(), kDecodeBlock, &cause);
+            if (got < 0) {
+                fail(cause);
+                return android::UNKNOWN_ERROR;
             }
-            for (sf_count_t i = 0; i < got; ++i) out[done + static_cast<size_t>(i)] = mScratch[static_cast<size_t>(i * mInfo.channels)];
-            done += static_cast<size_t>(got);
+            mEnded = got == 0;
+            for (long i = 0; i < got; ++i) mPending.push_back(toPcm16(mBlock[static_cast<size_t>(i)]));
         }
-        std::fill(out + done, out + n, int16_t{0});
+        const size_t n = mPacing.next(count);
+        const size_t fromFile = std::min(n, mPending.size() - mHead);
+        std::copy_n(mPending.begin() + static_cast<std::ptrdiff_t>(mHead), fromFile, out);
+        std::fill(out + fromFile, out + n, int16_t{0});
+        mHead += fromFile;
+        mDelivered += fromFile;
+        if (mHead >= static_cast<size_t>(kDecodeBlock)) {
+            mPending.erase(mPending.begin(), mPending.begin() + static_cast<std::ptrdiff_t>(mHead));
+            mHead = 0;
+        }
+        std::lock_guard<std::mutex> lock(mStatusLock);
+        mProgress.ended = mEnded && mHead == mPending.size();
+        // Conversion may end a sample or two away from the exact length: the end is the total.
+        mProgress.seconds = mProgress.ended ? mProgress.totalSeconds
+                                            : std::min(static_cast<double>(mDelivered) / mRate, mProgress.totalSeconds);
         return static_cast<ssize_t>(n);
     }
 
     void stop() override { mPacing.stop(); }
-    std::string failure() const override { return {}; }
 
-private:
-    const std::string mPath;
-    SNDFILE* const mFile;
-    const SF_INFO mInfo;
-    std::vector<int16_t> mScratch;  // one chunk of interleaved frames
-    CapturePacing mPacing;
-    bool mOpened = false;
-    bool mAtEnd = false;
-};
-
-SNDFILE* createWav(const std::string& path, uint32_t rate) {
-    SF_INFO info{};
-    info.samplerate = static_cast<int>(rate);
-    info.channels = 1;
-    info.format = SF_FORMAT_WAV | SF_FORMAT_PCM_16;
-    SNDFILE* file = sf_open(path.c_str(), SFM_WRITE, &info);
-    // The header follows every write, so the file stays valid if the process dies.
-    if (file) sf_command(file, SFC_SET_UPDATE_HEADER_AUTO, nullptr, SF_TRUE);
-    return file;
-}
-
-class WavOutputRoute : public OutputRoute {
-public:
-    WavOutputRoute(std::string path, SNDFILE* file)
-        : mPath(std::move(path)), mFile(file), mRate(kDefaultRate) {}
-    ~WavOutputRoute() override {
-        if (mFile) sf_close(mFile);
-    }
-
-    int open(uint32_t sampleRate) override {
-        if (sampleRate == 0) return android::BAD_VALUE;
-        if (sampleRate != mRate) {
-            if (mWritten == 0) {
-                // Nothing kept yet: start the file again at the output's rate.
-                if (mFile) sf_close(mFile);
-                mFile = createWav(mPath, sampleRate);
-                if (!mFile) {
-                    __android_log_print(ANDROID_LOG_ERROR, kTag, "wav:%s: %s", mPath.c_str(),
-                                        sf_strerror(nullptr));
-                    return android::UNKNOWN_ERROR;
-                }
-                mRate = sampleRate;
-            } else {
-                // One file has one rate: later samples are kept at the first rate.
-                __android_log_print(ANDROID_LOG_ERROR, kTag,
-                                    "wav:%s is kept at %u Hz, the output now runs at %u Hz",
-                                    mPath.c_str(), mRate, sampleRate);
-            }
-        }
-        mPacing.start(sampleRate);
-        return 0;
-    }
-
-    int write(const int16_t* samples, size_t count) override {
-        int rc = 0;
-        if (mFile && count > 0) {
-            if (sf_writef_short(mFile, samples, static_cast<sf_count_t>(count)) != static_cast<sf_count_t>(count)) {
-                std::lock_guard<std::mutex> lock(mFailureLock);
-                mFailure = std::string("cannot write: ") + sf_strerror(mFile);
-                rc = android::UNKNOWN_ERROR;
-            }
-            mWritten += count;
-        }
-        mPacing.next(count);
-        return rc;
-    }
-
-    void stop() override { mPacing.stop(); }
     std::string failure() const override {
-        std::lock_guard<std::mutex> lock(mFailureLock);
+        std::lock_guard<std::mutex> lock(mStatusLock);
         return mFailure;
     }
 
+    SourceProgress progress() const override {
+        std::lock_guard<std::mutex> lock(mStatusLock);
+        return mProgress;
+    }
+
 private:
-    const std::string mPath;
-    SNDFILE* mFile;
-    uint32_t mRate;
-    uint64_t mWritten = 0;
-    OutputPacing mPacing;
-    mutable std::mutex mFailureLock;
+    void fail(const std::string& cause) {
+        mFailed = true;
+        std::lock_guard<std::mutex> lock(mStatusLock);
+        mFailure = cause;
+    }
+
+    const std::unique_ptr<SoundFileInput> mInput;
+    ResampledInput mConverted;
+    std::vector<float> mBlock;
+    std::vector<int16_t> mPending;  // converted samples not delivered yet, from mHead on
+    size_t mHead = 0;
+    bool mEnded = false;
+    uint64_t mDelivered = 0;
+    uint32_t mRate = 0;  // 0 until opened
+    bool mFailed = false;
+    CapturePacing mPacing;
+    mutable std::mutex mStatusLock;
     std::string mFailure;
+    SourceProgress mProgress;
 };
 
 }  // namespace
 
 bool checkWavCapture(const std::string& path, std::string* reason) {
-    std::string error;
-    auto route = makeWavCaptureRoute(path, &error);
-    if (!route && reason) *reason = error;
-    return route != nullptr;
-}
-
-bool checkWavOutput(const std::string& path, std::string* reason) {
-    struct stat st{};
-    const bool existed = stat(path.c_str(), &st) == 0;
-    if (existed && S_ISDIR(st.st_mode)) {
-        if (reason) *reason = "cannot write: Is a directory";
+    SoundFileInput input;
+    std::vector<float> block(kDecodeBlock);
+    std::string cause;
+    if (!input.open(path, &cause)) {
+        if (reason) *reason = cause;
         return false;
     }
-    SNDFILE* file = createWav(path, kDefaultRate);
-    if (!file) {
-        if (reason) *reason = std::string("cannot write: ") + std::strerror(errno);
-        return false;
-    }
-    const int16_t probe[1] = {0};
-    const bool ok = sf_writef_short(file, probe, 1) == 1 && sf_error(file) == SF_ERR_NO_ERROR;
-    const std::string why = sf_strerror(file);
-    sf_close(file);
-    if (!existed) unlink(path.c_str());
-    if (!ok && reason) *reason = "cannot write: " + why;
-    return ok;
+    const sf_count_t got = input.readMono(block.data(), kDecodeBlock, &cause);
+    if (got <= 0 && reason) *reason = got < 0 ? cause : "has no samples";
+    return got > 0;
 }
 
 std::unique_ptr<CaptureRoute> makeWavCaptureRoute(const std::string& path, std::string* error) {
-    SF_INFO info{};
-    SNDFILE* file = sf_open(path.c_str(), SFM_READ, &info);
-    if (!file) {
-        if (error) *error = "cannot read WAV file '" + path + "': " + sf_strerror(nullptr);
+    auto input = std::make_unique<SoundFileInput>();
+    std::string cause;
+    if (!input->open(path, &cause)) {
+        if (error) *error = cause;
         return nullptr;
     }
-    if (info.channels < 1) {
-        sf_close(file);
-        if (error) *error = "WAV file '" + path + "' has no channel";
-        return nullptr;
-    }
-    return std::make_unique<WavCaptureRoute>(path, file, info);
-}
-
-std::unique_ptr<OutputRoute> makeWavOutputRoute(const std::string& path, std::string* error) {
-    SNDFILE* file = createWav(path, kDefaultRate);
-    if (!file) {
-        if (error) *error = "cannot write WAV file '" + path + "': " + sf_strerror(nullptr);
-        return nullptr;
-    }
-    return std::make_unique<WavOutputRoute>(path, file);
+    return std::make_unique<WavCaptureRoute>(std::move(input));
 }
 
 }  // namespace platform
