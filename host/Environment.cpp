@@ -1,5 +1,7 @@
 #include "host/Environment.h"
 
+#include "host/Output.h"
+
 #include <cstdlib>
 
 #include <korvo/platform/Log.h>
@@ -40,6 +42,7 @@ void applyLogSettings(int verbose) {
 bool applyEnvironment(const CommonOptions& common, std::string* error) {
     if (!applyRoute("KORVO_MIC", common.mic, error)) return false;
     if (!applyRoute("KORVO_SPEAKER", common.speaker, error)) return false;
+    if (korvo::platform::speakerRoute() == "wav:-") moveHostOutputToStderr();
     applyLogSettings(common.verbose);
     return true;
 }

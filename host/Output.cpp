@@ -91,6 +91,11 @@ std::string plural(long long n, const char* one, const char* many) {
     return std::to_string(n) + " " + (n == 1 ? one : many ? many : std::string(one) + "s");
 }
 
+void moveHostOutputToStderr() {
+    if (gOut != nullptr && gOut != stderr) fclose(gOut);
+    gOut = stderr;
+}
+
 bool hostOutputIsTerminal() { return isatty(fileno(hostOut())) != 0; }
 
 void errf(const char* fmt, ...) {

@@ -35,6 +35,8 @@ void resultf(const JsonEvent& event, const char* fmt, ...) __attribute__((format
 void progressf(const JsonEvent& event, const char* fmt, ...) __attribute__((format(printf, 2, 3)));
 // "1 code", "2 codes".
 std::string plural(long long n, const char* one, const char* many = nullptr);
+// Sends the host's own lines to stderr: standard output carries the speaker's sound.
+void moveHostOutputToStderr();
 // Whether the host's own standard output is a terminal (descriptor 1 may be a pipe
 // to the plug-in's line handler meanwhile).
 bool hostOutputIsTerminal();

@@ -55,6 +55,7 @@ TEST_F(Capture, MeterLifeAndItsLogLines) {
 
     // One analysis thread per process; any meter's destruction ends it before "deleted".
     SoundMeter other;
+    readShared();  // the record's first use and its line, before the thread's first turn
     meter->start_wf_thread();
     android::WaveformCanvas* thread = WF_Thread.get();
     ASSERT_NE(thread, nullptr);

@@ -40,7 +40,10 @@ std::vector<int16_t> readWav(const std::string& path, int* rate) {
 
 Child::Child(const host::EnvList& env, bool captureStderr) {
     std::string error;
-    EXPECT_TRUE(start(host::selfExecutable(), {"child"}, env, {captureStderr, true}, &error)) << error;
+    host::ChildProcess::Options options;
+    options.captureStderr = captureStderr;
+    options.nullStdin = true;
+    EXPECT_TRUE(start(host::selfExecutable(), {"child"}, env, options, &error)) << error;
 }
 
 bool Child::waitReady(int timeoutMs) {

@@ -34,6 +34,11 @@ int64_t monotonicNs() {
 
 std::string systemCause(int error) { return std::string("cannot write: ") + std::strerror(error); }
 
+// The standard output the process started with, taken when the platform is loaded: a host
+// may point descriptor 1 elsewhere later (at a pipe of its own) and "wav:-" still goes
+// where the user sent the process's output.
+const int kStartupStdout = fcntl(STDOUT_FILENO, F_DUPFD_CLOEXEC, 3);
+
 class WavOutputRoute : public OutputRoute {
 public:
     explicit WavOutputRoute(int fd) : mFd(fd) {}
@@ -149,7 +154,7 @@ private:
 bool checkWavOutput(const std::string& path, std::string* reason) {
     std::string cause;
     if (path == "-") {
-        const int flags = fcntl(STDOUT_FILENO, F_GETFL);
+        const int flags = fcntl(kStartupStdout, F_GETFL);
         if (flags < 0 || (flags & O_ACCMODE) == O_RDONLY) cause = systemCause(flags < 0 ? errno : EBADF);
     } else {
         struct stat st {};
@@ -185,7 +190,7 @@ bool checkWavOutput(const std::string& path, std::string* reason) {
 
 std::unique_ptr<OutputRoute> makeWavOutputRoute(const std::string& path, std::string* error) {
     // The descriptor is taken now, so that a path that cannot be written fails up front.
-    const int fd = path == "-" ? fcntl(STDOUT_FILENO, F_DUPFD_CLOEXEC, 3)
+    const int fd = path == "-" ? fcntl(kStartupStdout, F_DUPFD_CLOEXEC, 3)
                                : ::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666);
     if (fd < 0) {
         if (error) *error = systemCause(errno);
