@@ -48,10 +48,6 @@ TEST_F(Capture, MeterLifeAndItsLogLines) {
                                      "D/[SoundMeter] bufferSize=4096", "D/[SoundMeter] nbChannels=0x1, bytesPerSample=0x2",
                                      "D/[SoundMeter] AudioRecord Set succeeded. sleep set to 11",
                                      "D/[SoundMeter] AudioRecord Set succeeded. sleep set to 11"}));
-    meter->setNeedAck(true);
-    EXPECT_EQ(meter->need_ack, 1);
-    meter->setNeedAck(false);
-    EXPECT_EQ(meter->need_ack, 0);
 
     // One analysis thread per process; any meter's destruction ends it before "deleted".
     SoundMeter other;

@@ -1,11 +1,9 @@
 // The soundmeter command as a user meets it: usage, unusable routes, routes that fail
 // while it runs, Ctrl-C, and its output modes.
 #include <signal.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <chrono>
-#include <fstream>
 #include <regex>
 
 #include <gtest/gtest.h>
@@ -65,21 +63,15 @@ TEST(HostCli, HelpVersionAndBadUsage) {
 }
 
 TEST(HostCli, UnusableRoutesAreRefusedBeforeAnything) {
-    const std::string dir = "/tmp/korvo-cli-" + std::to_string(getpid());
-    ASSERT_EQ(mkdir(dir.c_str(), 0700), 0);
-    std::ofstream(dir + "/empty.wav").close();
-    std::ofstream(dir + "/garbage.wav") << "this is no sound file, only words";
+    // Each command checks the routes it uses (the causes themselves: the recordings test).
     const std::pair<std::vector<std::string>, std::string> cases[] = {
         {{"say", "5", "--speaker", "wav:/proc/x.wav"}, "speaker wav:/proc/x.wav: cannot write"},
-        {{"say", "5", "--speaker", "wav:" + dir + "/no/x.wav"}, "speaker wav:" + dir + "/no/x.wav: cannot write"},
-        {{"say", "5", "--speaker", "wav:" + dir}, "Is a directory"},
-        {{"say", "5", "--speaker", "wav:/dev/full"}, "speaker wav:/dev/full: cannot write"},
+        {{"sweep", "--speaker", "wav:/dev/full"}, "speaker wav:/dev/full: cannot write"},
         {{"say", "5", "--speaker", "card:nosuch"}, "speaker card:nosuch: "},
         {{"handshake", "--role", "speaker", "--no-ack", "--speaker", "wav:/proc/x.wav"}, "speaker wav:/proc/x.wav"},
         {{"listen", "--mic", "wav:/nonexistent.wav", "--seconds", "3"}, "microphone wav:/nonexistent.wav: cannot"},
-        {{"listen", "--code", "5", "--mic", "wav:" + dir + "/empty.wav"}, "microphone wav:" + dir + "/empty.wav: "},
-        {{"monitor", "--mic", "wav:" + dir + "/garbage.wav"}, "microphone wav:" + dir + "/garbage.wav: "},
-        {{"listen", "--mic", "card:nosuch"}, "microphone card:nosuch: "},
+        {{"monitor", "--mic", "wav:/proc"}, "microphone wav:/proc: "},
+        {{"listen", "--code", "5", "--mic", "card:nosuch"}, "microphone card:nosuch: "},
         {{"demo", "--speaker", "wav:/proc/x.wav"}, "speaker wav:/proc/x.wav"},
     };
     for (const auto& [args, says] : cases) {
@@ -88,11 +80,10 @@ TEST(HostCli, UnusableRoutesAreRefusedBeforeAnything) {
         EXPECT_EQ(r.status, 2) << says;
         EXPECT_TRUE(oneLine(r, says));
         EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(5)) << says;  // nothing waited out
-        EXPECT_EQ(r.out.find("said"), std::string::npos);
+        EXPECT_EQ(r.out, "");
     }
     const ProcessResult noise = run({"listen", "--mic", "sim:x"}, {{"KORVO_SIM_NOISE", "loud"}});
     EXPECT_TRUE(noise.status == 2 && oneLine(noise, "microphone sim:x: KORVO_SIM_NOISE='loud' is not"));
-    EXPECT_EQ(system(("rm -r " + dir).c_str()), 0);
 }
 
 TEST(HostCli, ARouteThatFailsWhileRunningEndsTheCommand) {
