@@ -6,6 +6,9 @@ packages=(
   g++ cmake make pkg-config binutils
   libgtest-dev libgmock-dev libbenchmark-dev
   libsndfile1-dev portaudio19-dev libcli11-dev libfftw3-dev
+  # The card test runs a private sound server that the card route reaches through
+  # ALSA's pulse plug-in.
+  pulseaudio libasound2-plugins
 )
 
 missing=()
