@@ -1,7 +1,6 @@
 // The card[:DEVICE] routes: a real sound card through PortAudio's blocking
 // streams, 44100 Hz (capture) mono 16-bit. DEVICE is empty for the default
 // device, a number for a device index, else a case-insensitive part of the name.
-#include <dlfcn.h>
 #include <log/log.h>
 #include <portaudio.h>
 #include <utils/Errors.h>
@@ -9,11 +8,10 @@
 #include <algorithm>
 #include <atomic>
 #include <cctype>
-#include <cstdarg>
-#include <cstdio>
 #include <mutex>
 #include <vector>
 
+#include "routes/CardSession.h"
 #include "routes/RouteFactories.h"
 
 namespace korvo {
@@ -25,12 +23,6 @@ constexpr const char* kTag = "SoundCard";
 constexpr double kCardRate = 44100.0;  // what every route is checked for up front
 // Blocking calls move this many frames at a time, so stop() is seen within ~6 ms.
 constexpr unsigned long kPieceFrames = 256;
-
-// PortAudio's set-up and tear-down are not thread-safe; neither is opening streams.
-std::mutex& paMutex() {
-    static std::mutex m;
-    return m;
-}
 
 // Error texts stay on one line whatever the user typed.
 std::string printable(std::string s) {
@@ -50,56 +42,9 @@ int channelsOf(const PaDeviceInfo* info, bool input) {
     return info ? (input ? info->maxInputChannels : info->maxOutputChannels) : 0;
 }
 
-// The audio back-ends under PortAudio print pages of probing chatter to stderr
-// (every missing card, every absent server); send it to the log instead. Looked
-// up at run time: they are PortAudio's dependencies, not ours.
-void backendChatter(const char* file, int line, const char* function, int err, const char* fmt, ...) {
-    char text[512];
-    va_list args;
-    va_start(args, fmt);
-    std::vsnprintf(text, sizeof text, fmt, args);
-    va_end(args);
-    __android_log_print(ANDROID_LOG_VERBOSE, kTag, "alsa: %s", text);
-}
-
-void serverChatter(const char* text) {
-    __android_log_print(ANDROID_LOG_VERBOSE, kTag, "jack: %s", text);
-}
-
-void quietBackends() {
-    using AlsaHandler = void (*)(const char*, int, const char*, int, const char*, ...);
-    using AlsaSetter = int (*)(AlsaHandler);
-    using JackSetter = void (*)(void (*)(const char*));
-    if (void* f = dlsym(RTLD_DEFAULT, "snd_lib_error_set_handler")) {
-        reinterpret_cast<AlsaSetter>(f)(&backendChatter);
-    }
-    for (const char* name : {"jack_set_error_function", "jack_set_info_function"}) {
-        if (void* f = dlsym(RTLD_DEFAULT, name)) reinterpret_cast<JackSetter>(f)(&serverChatter);
-    }
-}
-
-// Holds one Pa_Initialize for the lifetime of a route.
-class PaSession {
-public:
-    PaSession() {
-        std::lock_guard<std::mutex> lock(paMutex());
-        static const bool quiet = (quietBackends(), true);
-        (void)quiet;
-        mStatus = Pa_Initialize();
-    }
-    ~PaSession() {
-        std::lock_guard<std::mutex> lock(paMutex());
-        if (mStatus == paNoError) Pa_Terminate();
-    }
-    PaError status() const { return mStatus; }
-
-private:
-    PaError mStatus;
-};
-
 // Finds the device; paNoDevice with a one-line reason when there is none.
 PaDeviceIndex findDevice(const std::string& device, bool input, std::string* error) {
-    std::lock_guard<std::mutex> lock(paMutex());
+    std::lock_guard<std::mutex> lock(card::paLock());
     const char* dir = input ? "input" : "output";
     auto fail = [&](const std::string& why) {
         if (error) *error = why;
@@ -143,7 +88,7 @@ public:
 
     bool open(double rate) {
         close();
-        std::lock_guard<std::mutex> lock(paMutex());
+        std::lock_guard<std::mutex> lock(card::paLock());
         const PaDeviceInfo* info = Pa_GetDeviceInfo(mDevice);
         PaStreamParameters p{};
         p.device = mDevice;
@@ -174,7 +119,7 @@ public:
 
     void close() {
         if (!mStream) return;
-        std::lock_guard<std::mutex> lock(paMutex());
+        std::lock_guard<std::mutex> lock(card::paLock());
         Pa_StopStream(mStream);
         Pa_CloseStream(mStream);
         mStream = nullptr;
@@ -190,7 +135,7 @@ private:
 
 class CardCaptureRoute : public CaptureRoute {
 public:
-    CardCaptureRoute(std::unique_ptr<PaSession> session, PaDeviceIndex device)
+    CardCaptureRoute(std::unique_ptr<card::Session> session, PaDeviceIndex device)
         : mSession(std::move(session)), mStream(device, true) {}
 
     int open(uint32_t sampleRate) override {
@@ -226,7 +171,7 @@ private:
         std::lock_guard<std::mutex> lock(mFailureLock);
         mFailure = why;
     }
-    std::unique_ptr<PaSession> mSession;  // outlives the stream
+    std::unique_ptr<card::Session> mSession;  // outlives the stream
     CardStream mStream;
     std::atomic<bool> mStopped{false};
     mutable std::mutex mFailureLock;
@@ -235,7 +180,7 @@ private:
 
 class CardOutputRoute : public OutputRoute {
 public:
-    CardOutputRoute(std::unique_ptr<PaSession> session, PaDeviceIndex device)
+    CardOutputRoute(std::unique_ptr<card::Session> session, PaDeviceIndex device)
         : mSession(std::move(session)), mStream(device, false) {}
 
     int open(uint32_t sampleRate) override {
@@ -268,7 +213,7 @@ public:
     }
 
 private:
-    std::unique_ptr<PaSession> mSession;
+    std::unique_ptr<card::Session> mSession;
     CardStream mStream;
     std::atomic<bool> mStopped{false};
     mutable std::mutex mFailureLock;
@@ -276,16 +221,16 @@ private:
 };
 
 // Starts PortAudio and finds the device; null with a one-line reason on failure.
-std::unique_ptr<PaSession> prepare(const std::string& device, bool input, PaDeviceIndex* index,
+std::unique_ptr<card::Session> prepare(const std::string& device, bool input, PaDeviceIndex* index,
                                    std::string* error) {
-    auto session = std::make_unique<PaSession>();
-    if (session->status() != paNoError) {
-        if (error) *error = std::string("PortAudio cannot start: ") + Pa_GetErrorText(session->status());
+    auto session = std::make_unique<card::Session>();
+    if (!session->ok()) {
+        if (error) *error = "no sound card: " + session->error();
         return nullptr;
     }
     *index = findDevice(device, input, error);
     if (*index == paNoDevice) return nullptr;
-    std::lock_guard<std::mutex> lock(paMutex());
+    std::lock_guard<std::mutex> lock(card::paLock());
     const PaDeviceInfo* info = Pa_GetDeviceInfo(*index);
     PaStreamParameters p{};
     p.device = *index;
@@ -312,12 +257,12 @@ bool checkCardRoute(const std::string& device, bool input, std::string* reason) 
 }
 
 bool listCardDevices(std::vector<CardDevice>* devices, std::string* error) {
-    PaSession session;
-    if (session.status() != paNoError) {
-        if (error) *error = std::string("PortAudio cannot start: ") + Pa_GetErrorText(session.status());
+    card::Session session;
+    if (!session.ok()) {
+        if (error) *error = session.error();
         return false;
     }
-    std::lock_guard<std::mutex> lock(paMutex());
+    std::lock_guard<std::mutex> lock(card::paLock());
     const PaDeviceIndex count = Pa_GetDeviceCount();
     if (count < 0) {
         if (error) *error = std::string("PortAudio cannot list devices: ") + Pa_GetErrorText(count);
