@@ -95,7 +95,10 @@ PaStreamParameters streamParameters(PaDeviceIndex device, bool input) {
     p.device = device;
     p.channelCount = 1;
     p.sampleFormat = paInt16;
-    p.suggestedLatency = info ? (input ? info->defaultLowInputLatency : info->defaultLowOutputLatency) : 0.05;
+    // The device's safe latency rather than its lowest: a code takes a few hundred
+    // milliseconds to be heard anyway, while buffers of a few milliseconds run dry
+    // whenever the machine is busy.
+    p.suggestedLatency = info ? (input ? info->defaultHighInputLatency : info->defaultHighOutputLatency) : 0.05;
     return p;
 }
 
