@@ -53,9 +53,11 @@ PaDeviceIndex chooseDevice(const std::string& device, bool input, std::string* e
         if (error) *error = why;
         return paNoDevice;
     };
+    // Named when asked for by name, so that the one line says what was looked for.
+    const std::string wanted = device.empty() ? "" : " for " + dir + " device '" + printable(device) + "'";
     const PaDeviceIndex count = Pa_GetDeviceCount();
-    if (count < 0) return fail("no sound card: the sound system cannot list devices: " + errorText(count));
-    if (count == 0) return fail("no sound card found");
+    if (count < 0) return fail("no sound card" + wanted + ": the sound system cannot list devices: " + errorText(count));
+    if (count == 0) return fail("no sound card found" + wanted);
     std::vector<PaDeviceIndex> all, candidates;
     for (PaDeviceIndex i = 0; i < count; ++i) {
         all.push_back(i);
@@ -77,12 +79,12 @@ PaDeviceIndex chooseDevice(const std::string& device, bool input, std::string* e
         }
         return d;
     }
-    const std::string wanted = lower(device);
+    const std::string part = lower(device);
     std::vector<PaDeviceIndex> matches;
     for (PaDeviceIndex i : candidates) {
         const std::string name = lower(nameOf(i));
-        if (name == wanted) return i;
-        if (name.find(wanted) != std::string::npos) matches.push_back(i);
+        if (name == part) return i;
+        if (name.find(part) != std::string::npos) matches.push_back(i);
     }
     if (matches.size() == 1) return matches.front();
     if (matches.empty()) return fail("no " + dir + " device matches '" + printable(device) + "'; devices: " + choices);
