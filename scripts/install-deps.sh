@@ -11,6 +11,9 @@ packages=(
   libsamplerate0-dev
   # the recording tests make their files with sox; its base formats hold FLAC and Ogg
   sox libsox-fmt-base
+  # The card test runs a private sound server that the card route reaches through
+  # ALSA's pulse plug-in.
+  pulseaudio libasound2-plugins
 )
 for preset in "$@"; do
   if [ "$preset" = clang ]; then packages+=(clang); fi
