@@ -52,7 +52,9 @@ protected:
             "--log-target=stderr", "-L", "module-null-sink sink_name=korvo rate=44100 channels=1",
             "-L", "module-native-protocol-unix socket=" + socket + " auth-anonymous=1"};
         std::string error;
-        ASSERT_TRUE(mServer.start(kServer, args, mEnv, {true, true}, &error)) << error;
+        korvo::host::ChildProcess::Options options;
+        options.captureStderr = options.nullStdin = true;
+        ASSERT_TRUE(mServer.start(kServer, args, mEnv, options, &error)) << error;
         // The socket comes with the last module: the server is ready once it is there.
         const int64_t deadline = monotonicMs() + 10000;
         while (!present(socket) && mServer.pump(20) && monotonicMs() < deadline) {

@@ -6,6 +6,7 @@
 #include <cstdarg>
 #include <cstdio>
 
+#include "routes/CardRuntimeDir.h"
 #include "routes/JackLeftovers.h"
 
 #if defined(__SANITIZE_ADDRESS__)
@@ -65,6 +66,7 @@ Session::Session() {
     std::lock_guard<std::mutex> lock(paLock());
     static const bool quiet = (quietBackends(), true);
     (void)quiet;
+    acquireRuntimeDir();
     JackLeftovers leftovers;
     {
 #ifdef KORVO_LEAK_CHECKER
@@ -82,6 +84,7 @@ Session::Session() {
 Session::~Session() {
     std::lock_guard<std::mutex> lock(paLock());
     if (mStatus == paNoError) Pa_Terminate();
+    releaseRuntimeDir();
 }
 
 std::string Session::error() const { return "the sound system cannot start: " + errorText(mStatus); }
