@@ -35,17 +35,13 @@ TEST(HostCli, HelpVersionAndBadUsage) {
     }
     EXPECT_TRUE(std::regex_match(run({"--version"}).out, std::regex("soundmeter [0-9]+\\.[0-9]+\\.[0-9]+\n")));
     const std::pair<std::vector<std::string>, std::string> cases[] = {
-        {{}, "subcommand is required"},
         {{"frobnicate"}, "unknown command 'frobnicate'"},
-        {{"say", "40"}, "CODE"},
         {{"listen", "--mic", "bogus"}, "--mic: unknown audio route 'bogus'"},
         {{"handshake", "--role", "speaker", "--first-code", "17"}, "--first-code"},  // its answer 18 is masked
         {{"listen", "--seconds", "nan"}, "--seconds: 'nan' is not a number"},
         {{"listen", "--seconds", "inf"}, "--seconds: 'inf' is not a number"},
         {{"sweep", "--seconds", "-nan"}, "--seconds"},
-        {{"monitor", "--seconds", "-1"}, "--seconds"},
         {{"demo", "--snr", "nan"}, "--snr: 'nan' is not a number"},
-        {{"demo", "--rounds", "0"}, "--rounds"},
         {{"listen", "--level", "201"}, "--level"},
         {{"handshake", "--role", "listener", "--level", "-101"}, "--level"},
         {{"-q", "--json", "listen"}, "cannot be used together"},
