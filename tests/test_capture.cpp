@@ -96,13 +96,8 @@ TEST_F(Capture, ToneGeneratorOwnership) {
             lines.push_back(l.msg);
     EXPECT_EQ(lines, (Strings{"[SoundMeter] makeToneGenerator", "MiniToneGenerator destructor",
                               "MiniToneGenerator constructor: streamType=3, volume=0.800000"}));
-    test::clearLog();
-    meter.releaseToneGenerator();
+    meter.releaseToneGenerator();  // its lines: the C host's check
     EXPECT_EQ(meter.toneGenerator, nullptr);
-    lines.clear();
-    for (const auto& l : test::logLines())
-        if (l.msg == "[SoundMeter] releaseToneGenerator" || l.msg == "MiniToneGenerator destructor") lines.push_back(l.msg);
-    EXPECT_EQ(lines, (Strings{"[SoundMeter] releaseToneGenerator", "MiniToneGenerator destructor"}));
 }
 
 TEST_F(Capture, MinimumBufferSize) {

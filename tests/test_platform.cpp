@@ -139,12 +139,12 @@ TEST_F(PlatformTest, ThreadLoopsUntilFalseOrRequestExitAndWait) {
     EXPECT_EQ(counted->join(), OK);
     EXPECT_EQ(counted->turns, 25);
     ASSERT_EQ(forever->run("forever"), OK);
-    ASSERT_TRUE(waitUntil([&] { return forever->turns > 3; }));
+    ASSERT_TRUE(waitFor([&] { return forever->turns > 3; }));
     EXPECT_EQ(forever->run("twice"), INVALID_OPERATION);
     EXPECT_EQ(forever->requestExitAndWait(), OK);
     EXPECT_FALSE(forever->isRunning());
     ASSERT_EQ(inside->run("inside"), OK);
-    ASSERT_TRUE(waitUntil([&] { return !inside->isRunning(); }));
+    ASSERT_TRUE(waitFor([&] { return !inside->isRunning(); }));
     EXPECT_EQ(inside->fromInside, WOULD_BLOCK);  // waiting for itself would never end
 }
 
@@ -243,7 +243,7 @@ TEST_F(PlatformTest, BlockedReadReturnsWithItsSamplesOrOnStop) {
     Samples frame(512, 5), buf(kRate, 1);
     const auto blockedRead = [&](size_t bytes) {  // once it has begun, and waits in the script if on
         auto f = std::async(std::launch::async, [&, bytes] { return r->read(buf.data(), bytes); });
-        EXPECT_TRUE(waitUntil([&] { return test::lastMicReadRequest() == bytes && test::micReadersWaiting() == scripted; }));
+        EXPECT_TRUE(waitFor([&] { return test::lastMicReadRequest() == bytes && test::micReadersWaiting() == scripted; }));
         return f;
     };
     ASSERT_EQ(r->start(), OK);
@@ -342,13 +342,13 @@ TEST_F(PlatformTest, TrackCallbackThreadIsPacedAndStops) {
     ASSERT_TRUE(test::waitTrackStopped(10000));
     EXPECT_TRUE(due(10 * kBlock, t0)) << "the writer keeps one buffer ahead: call 12 comes after 10 played";
     EXPECT_NE(p.thread.load(), std::this_thread::get_id());
-    EXPECT_FALSE(waitUntil([&] { return p.calls > 12; }, 100));  // none while stopped
+    EXPECT_FALSE(waitFor([&] { return p.calls > 12; }, 100));  // none while stopped
     EXPECT_EQ(test::trackStops(), 1);
     // stop() never waits for a callback, here one blocked on a lock this thread holds.
     std::unique_lock<std::mutex> held(gate);
     p.gate = &gate;
     ASSERT_EQ(t->start(), OK);  // resumes
-    ASSERT_TRUE(waitUntil([&] { return p.calls > 12; }));
+    ASSERT_TRUE(waitFor([&] { return p.calls > 12; }));
     auto stopping = std::async(std::launch::async, [&] { t->stop(); });
     EXPECT_EQ(stopping.wait_for(std::chrono::seconds(5)), std::future_status::ready);
     held.unlock();

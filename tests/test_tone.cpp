@@ -120,23 +120,6 @@ TEST_F(ToneTestCase, LimitedToneBlockByBlock) {
     EXPECT_EQ(locked(gen, &Engine::mTotalSmp), 1764u);
     EXPECT_EQ(toneCount("prepareWave, duration limited to -1 ms"), 0);
     EXPECT_TRUE(pumped(gen, Engine::TONE_INIT, kSilence, {"Stopped Cbk", "Cbk Stopped track"}, 0));
-
-    // Other events, empty buffers and callbacks without a tone change nothing.
-    Samples buf(882, 7);
-    android::AudioTrack::Buffer b;
-    b.frameCount = buf.size(), b.size = 1764, b.i16 = buf.data();
-    Engine::audioCallback(android::AudioTrack::EVENT_UNDERRUN, &gen, &b);
-    b.size = 0;
-    Engine::audioCallback(android::AudioTrack::EVENT_MORE_DATA, &gen, &b);
-    EXPECT_EQ(buf, Samples(882, 7));
-    for (uint16_t state : {Engine::TONE_INIT, Engine::TONE_IDLE, Engine::TONE_REINIT}) {
-        gen.mState.store(state);
-        test::clearLog();
-        b.size = 1764;
-        Engine::audioCallback(android::AudioTrack::EVENT_MORE_DATA, &gen, &b);
-        EXPECT_TRUE(b.size == 0u && stateOf(gen) == state && toneLog() == Strings{"Extra Cbk"}) << state;
-    }
-    gen.mState.store(Engine::TONE_INIT);
 }
 
 TEST_F(ToneTestCase, SegmentsAndLoops) {
@@ -237,9 +220,6 @@ TEST_F(ToneTestCase, BlocksRatesAndPrepareWave) {
         gen.prepareWave();
         EXPECT_EQ(gen.mMaxSmp, maxSmp) << ms;
     }
-    gen.mpNewToneDesc = &Engine::sToneDescriptors[1];  // the table's own: one infinite segment
-    gen.prepareWave();
-    EXPECT_TRUE(gen.mNextSegSmp == kInf && gen.mWaveGens.size() == 1u && gen.mWaveGens.keyAt(0) == 3440);
     pthread_mutex_unlock(&gen.mLock);
 }
 
@@ -302,18 +282,7 @@ TEST_F(ToneTestCase, EngineStartsStopsAndRestarts) {
     test::pumpTrack();
     ASSERT_TRUE(ready(stopped));
     EXPECT_EQ(gen.mWaveGens.size(), 0u);
-    // Past 0x7FFFFFFF / rate seconds (48695) whole seconds count; an unknown start time cuts at once.
-    ASSERT_TRUE(startAndPump(gen, 0, -1));
-    pthread_mutex_lock(&gen.mLock);
-    gen.mStartTime.tv_sec -= 50000;
-    pthread_mutex_unlock(&gen.mLock);
-    stopped = stopAsync(gen);
-    EXPECT_EQ(locked(gen, &Engine::mMaxSmp), 50000u * 44100u);
-    pthread_mutex_lock(&gen.mLock);
-    gen.mTotalSmp = 50000u * 44100u;
-    pthread_mutex_unlock(&gen.mLock);
-    drain(gen);
-    ASSERT_TRUE(ready(stopped));
+    // An unknown start time cuts the tone at once.
     ASSERT_TRUE(startAndPump(gen, 0, -1));
     pthread_mutex_lock(&gen.mLock);
     gen.mStartTime.tv_sec = 0;
@@ -374,10 +343,6 @@ TEST_F(ToneTestCase, EngineFailures) {
     EXPECT_TRUE(startAndPump(gen, 0, 20));
     EXPECT_EQ(test::tracksCreated(), 2);
     drain(gen);
-    // An initCheck failure from a ready engine releases the track and leaves the state.
-    test::failTrackInitCheck(android::NO_INIT);
-    EXPECT_FALSE(gen.initAudioTrack());
-    EXPECT_TRUE(stateOf(gen) == Engine::TONE_INIT && gen.mpAudioTrack == nullptr);
 
     // The output rate unknown: no track, no tone, until the platform answers.
     SetUp();
@@ -421,6 +386,10 @@ TEST_F(ToneTestCase, TimedWaits) {
         EXPECT_TRUE(inOrder(toneLog(), {"startTone", line + status}));
         // The wait for a stop returns without the failure line.
         EXPECT_EQ(logOf("MiniToneGenerator", "Tone start failed!!!").size(), before == 2 ? 0u : 1u);
+        if (before == 1) {  // a callback now finds no tone: an empty buffer, nothing changed
+            test::clearLog();
+            EXPECT_TRUE(test::pumpTrack().sizeBytes == 0u && toneLog() == Strings{"Extra Cbk"} && stateOf(gen) == Engine::TONE_IDLE);
+        }
     }
     // Callbacks stop while a tone plays (the real playback thread, paused): the stop times out,
     // stops the track and deletes the generators.

@@ -44,13 +44,8 @@ static int failures = 0;
 static char logPath[256];
 static char outPath[256];
 
-#define CHECK(cond, what)                                        \
-    do {                                                         \
-        if (!(cond)) {                                           \
-            fprintf(stderr, "FAILED: %s (line %d)\n", what, __LINE__); \
-            failures++;                                          \
-        }                                                        \
-    } while (0)
+#define CHECK(cond, what) \
+    ((cond) ? (void)0 : (void)(fprintf(stderr, "FAILED: %s (line %d)\n", what, __LINE__), failures++))
 
 static char* slurp(const char* path) {
     FILE* f = fopen(path, "rb");
@@ -79,9 +74,7 @@ static bool hasSince(const char* path, long since, const char* text) {
     return found;
 }
 
-static void clearSpectrum(float* s) {
-    for (int i = 0; i < 256; i++) s[i] = 0.0f;
-}
+static void clearSpectrum(float* s) { memset(s, 0, 256 * sizeof(float)); }
 
 int main(int argc, char** argv) {
     if (argc < 2) {

@@ -14,15 +14,6 @@
 namespace korvo {
 namespace platformtest {
 
-bool waitUntil(const std::function<bool()>& pred, int timeoutMs) {
-    const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
-    while (!pred()) {
-        if (std::chrono::steady_clock::now() > end) return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(1));
-    }
-    return true;
-}
-
 std::string readFile(const std::string& path) {
     std::ifstream in(path, std::ios::binary);
     return {std::istreambuf_iterator<char>(in), {}};
@@ -48,11 +39,11 @@ Child::Child(const host::EnvList& env, bool captureStderr) {
 
 bool Child::waitReady(int timeoutMs) {
     const auto ready = [&] { return out().find("ready\n") != std::string::npos; };
-    return waitUntil([&] { return !pump(10) || ready(); }, timeoutMs) && ready();
+    return waitFor([&] { return !pump(10) || ready(); }, timeoutMs) && ready();
 }
 
 int Child::waitExit(int timeoutMs) {
-    waitUntil([&] { return !pump(10); }, timeoutMs);
+    waitFor([&] { return !pump(10); }, timeoutMs);
     int status = -1;
     return wait(timeoutMs, &status) ? status : -1;
 }

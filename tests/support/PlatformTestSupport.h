@@ -14,14 +14,14 @@
 #include <korvo/platform/TestControl.h>
 
 #include "host/ChildProcess.h"
+#include "support/LibraryTestSupport.h"
 
 namespace korvo {
 namespace platformtest {
 
 namespace test = korvo::platform::test;
 
-// Polls `pred` until it holds; false when `timeoutMs` ran out first.
-bool waitUntil(const std::function<bool()>& pred, int timeoutMs = 5000);
+using korvo::testing::waitFor;
 std::string readFile(const std::string& path);
 // A 16-bit mono WAV file's samples as an independent reader sees them (empty when unreadable).
 std::vector<int16_t> readWav(const std::string& path, int* rate);

@@ -10,11 +10,6 @@ Strings toneLog() {
     return out;
 }
 
-int toneCount(const std::string& msg) {
-    const Strings all = toneLog();
-    return static_cast<int>(std::count(all.begin(), all.end(), msg));
-}
-
 ::testing::AssertionResult inOrder(const Strings& lines, const Strings& wanted) {
     auto matches = [](const std::string& line, const std::string& want) {
         return !want.empty() && want.back() == '*' ? line.compare(0, want.size() - 1, want, 0, want.size() - 1) == 0
@@ -27,7 +22,7 @@ int toneCount(const std::string& msg) {
 }
 
 bool startAndPump(Engine& gen, int code, int ms, test::PumpResult* first, size_t samples) {
-    const int waits = toneCount("Wait for start callback");
+    const long waits = toneCount("Wait for start callback");
     auto started = std::async(std::launch::async, [&gen, code, ms] { return gen.startTone(code, ms); });
     EXPECT_TRUE(waitFor([&] { return toneCount("Wait for start callback") > waits; }));
     test::PumpResult p = test::pumpTrack(samples);
@@ -37,7 +32,7 @@ bool startAndPump(Engine& gen, int code, int ms, test::PumpResult* first, size_t
 }
 
 std::future<void> stopAsync(Engine& gen) {
-    const int waits = toneCount("waiting cond");
+    const long waits = toneCount("waiting cond");
     auto stopped = std::async(std::launch::async, [&gen] { gen.stopTone(); });
     EXPECT_TRUE(waitFor([&] { return toneCount("waiting cond") > waits; }));
     return stopped;

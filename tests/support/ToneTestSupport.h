@@ -20,7 +20,7 @@ constexpr unsigned kInf = Engine::TONEGEN_INF;
 
 // The engine's kept messages; how often one was logged.
 Strings toneLog();
-int toneCount(const std::string& msg);
+inline long toneCount(const std::string& msg) { const Strings all = toneLog(); return std::count(all.begin(), all.end(), msg); }
 // `wanted` occurs in `lines` in this order; a wanted line ending in '*' matches by prefix.
 ::testing::AssertionResult inOrder(const Strings& lines, const Strings& wanted);
 
