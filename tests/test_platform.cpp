@@ -370,17 +370,21 @@ TEST_F(PlatformTest, PumpedSamplesReachTheWavSpeakerAndTheWavMicrophonePlaysThem
         p.shortBytes = 100;
         EXPECT_EQ(test::pumpTrack().sizeBytes, 100u);
     }
+    // The recording holds every sample period: a pump slower than real time (a loaded machine,
+    // a sanitizer) adds the silence the device played meanwhile, nothing else.
     const Samples written = probeSamples({{1, 882}, {2, 882}, {0, 882}, {4, 50}});
     int rate = 0;
-    EXPECT_EQ(readWav(path, &rate), written);
+    const Samples file = readWav(path, &rate);
+    const auto sound = [](Samples x) { return x.erase(std::remove(x.begin(), x.end(), 0), x.end()), x; };
+    EXPECT_TRUE(file.size() >= written.size() && file.size() < written.size() + 3000 && sound(file) == sound(written));
     EXPECT_EQ(rate, 44100);
     setenv("KORVO_MIC", ("wav:" + path).c_str(), 1);
     sp<AudioRecord> r = makeRecord();
-    Samples heard(3000, 1);
+    Samples heard(file.size() + 500, 1);
     ASSERT_EQ(r->start(), OK);
-    ASSERT_EQ(r->read(heard.data(), 6000), 6000);
-    EXPECT_TRUE(std::equal(written.begin(), written.end(), heard.begin()));
-    EXPECT_EQ(Samples(heard.begin() + written.size(), heard.end()), Samples(heard.size() - written.size(), 0));
+    ASSERT_EQ(r->read(heard.data(), heard.size() * 2), ssize_t(heard.size() * 2));
+    EXPECT_TRUE(std::equal(file.begin(), file.end(), heard.begin()));
+    EXPECT_EQ(Samples(heard.begin() + file.size(), heard.end()), Samples(500, 0));
 }
 
 // ---- routes ---------------------------------------------------------------------------
