@@ -99,11 +99,8 @@ TEST_F(Analysis, FactorsAndTables) {
         const int nf = static_cast<int>(factors.size());
         ASSERT_EQ(fft.wavetable->length, 2 * n + 15);
         EXPECT_EQ(w[2 * n], n);
-        EXPECT_EQ(std::vector<int>(w + 2 * n + 1, w + 2 * n + 2 + nf), [&] {
-            std::vector<int> v = {nf};
-            v.insert(v.end(), factors.begin(), factors.end());
-            return v;
-        }()) << n;
+        EXPECT_EQ(w[2 * n + 1], nf);
+        EXPECT_EQ(std::vector<int>(w + 2 * n + 2, w + 2 * n + 2 + nf), factors) << n;
         for (int i = 0; i < n; ++i) ASSERT_EQ(w[i], 0.0) << i;
     }
     // Length 1: 17 entries, none written; decided: length 0 has no transform.
