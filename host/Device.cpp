@@ -21,6 +21,10 @@ bool Device::open(const DeviceSettings& settings, std::string* error) {
     mMeter->setRole(settings.role);
     mMeter->setNeedAck(settings.needAck);
     if (settings.setLevel) mMeter->setDetectionLevel(settings.level);
+    // The capture ring starts with whatever memory held, and the analysis thread takes its
+    // slots in turn: until every slot holds captured sound, a read-out can show a code
+    // nobody said. Capture steps first fill the ring and let the analysis catch up.
+    stepUntil(monotonicMs() + kWarmUpMs);
     return true;
 }
 

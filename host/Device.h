@@ -14,6 +14,9 @@ namespace host {
 // Time a tone needs after its duration to be out of the room: the fade-out block
 // (20 ms), the route's latency and some slack for a loaded machine.
 constexpr int kToneTailMs = 250;
+// Capture before a device listens: five frames of 11.6 ms fill the ring, and the analysis
+// thread, one frame per 20 ms turn, takes frames that were captured.
+constexpr int kWarmUpMs = 150;
 
 struct DeviceSettings {
     int role = 0;           // 1 listener, 2 speaker, 3 both
