@@ -50,6 +50,7 @@ public:
     // signal ended it).
     bool wait(int timeoutMs, int* status);
     bool running() const { return mPid > 0; }
+    pid_t pid() const { return mPid; }
 
 private:
     pid_t mPid = -1;

@@ -1,6 +1,8 @@
 // The card route for real: a private sound server with a null sink, whose monitor is
 // the default source, stands in for a sound card; the soundmeter processes reach it
 // through ALSA's default device (the pulse plug-in) and only through their environment.
+#include <fcntl.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -29,6 +31,15 @@ bool present(const std::string& path) {
     return lstat(path.c_str(), &st) == 0;
 }
 
+// The JACK folder, looked at between the card routes' start-ups, which hold /dev/shm's lock.
+bool jackFolderPresent() {
+    const int shm = open("/dev/shm", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    flock(shm, LOCK_EX);
+    const bool there = present("/dev/shm/jack_db-" + std::to_string(getuid()));
+    close(shm);
+    return there;
+}
+
 class HostCard : public ::testing::Test {
 protected:
     void SetUp() override {
@@ -44,7 +55,7 @@ protected:
         mEnv = {{"PULSE_SERVER", "unix:" + socket}, {"PULSE_RUNTIME_PATH", run + "/pulse"},
                 {"XDG_RUNTIME_DIR", run},          {"HOME", mDir + "/home"},
                 {"DISPLAY", ""},                   {"DBUS_SESSION_BUS_ADDRESS", ""}};
-        mJackDbWasThere = present("/dev/shm/jack_db-" + std::to_string(getuid()));
+        mJackDbWasThere = jackFolderPresent();
         // No shared memory (nothing left in /dev/shm), no default script, never idle out.
         const std::vector<std::string> args = {
             kServer, "-n", "--daemonize=no", "--use-pid-file=no", "--exit-idle-time=-1", "--disable-shm=yes",
@@ -74,7 +85,7 @@ protected:
         }
         if (!mDir.empty()) std::filesystem::remove_all(mDir);
         if (!mJackDbWasThere) {
-            EXPECT_FALSE(present("/dev/shm/jack_db-" + std::to_string(getuid()))) << "the JACK probe's folder is left";
+            EXPECT_FALSE(jackFolderPresent()) << "the JACK probe's folder is left";
         }
     }
 

@@ -63,7 +63,7 @@ TEST(HostDemo, ADeviceThatStopsRespondingEndsTheDemo) {
     ASSERT_TRUE(demo.start({"demo", "--rounds", "20", "--timeout-ms", "1000", "--tone-ms", "300"}));
     ASSERT_TRUE(demo.waitForOutput("listener  hears", kReadyMs));
     // The listener is the demo's child with its role on the command line.
-    const ProcessResult ps = runHost("/usr/bin/pgrep", {"-f", "handshake --role listener --rounds 20 --tone-ms 300 --timeout-ms 1000"}, 5000);
+    const ProcessResult ps = runHost("/usr/bin/pgrep", {"-P", std::to_string(demo.pid()), "-f", "role listener"}, 5000);
     ASSERT_EQ(ps.status, 0);
     const pid_t listener = std::stoi(ps.out);
     ASSERT_EQ(kill(listener, SIGSTOP), 0);

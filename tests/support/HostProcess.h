@@ -28,6 +28,7 @@ public:
     // Collects output until stdout holds `text` or the time is up.
     bool waitForOutput(const std::string& text, int timeoutMs);
     void sendSignal(int sig) { mChild.sendSignal(sig); }
+    pid_t pid() const { return mChild.pid(); }
     // Collects output until the child ends; kills it after timeoutMs.
     ProcessResult finish(int timeoutMs);
 
