@@ -1,14 +1,13 @@
 // The wav route as a microphone: a recording's samples, mixed down to mono and converted
 // to the stream's rate, at the real-time pace of a microphone; after the file, silence.
 #include <algorithm>
-#include <cmath>
 #include <mutex>
 #include <vector>
 
 #include <utils/Errors.h>
 
 #include "routes/Pacer.h"
-#include "routes/ResampledInput.h"
+#include "routes/RecordingReader.h"
 #include "routes/RouteFactories.h"
 #include "routes/SoundFileInput.h"
 
@@ -19,23 +18,18 @@ namespace {
 
 constexpr long kDecodeBlock = 1024;
 
-int16_t toPcm16(float v) {
-    return static_cast<int16_t>(std::lrint(std::clamp(v * 32768.0f, -32768.0f, 32767.0f)));
-}
-
 class WavCaptureRoute : public CaptureRoute {
 public:
-    explicit WavCaptureRoute(std::unique_ptr<SoundFileInput> input)
-        : mInput(std::move(input)), mConverted(*mInput), mBlock(kDecodeBlock) {
+    explicit WavCaptureRoute(std::unique_ptr<SoundFileInput> input) : mReader(std::move(input)), mBlock(kDecodeBlock) {
         mProgress.finite = true;
-        mProgress.totalSeconds = static_cast<double>(mInput->frames()) / mInput->rate();
+        mProgress.totalSeconds = mReader.totalSeconds();
     }
 
     int open(uint32_t sampleRate) override {
         std::string cause;
         if (sampleRate == 0) {
             cause = "cannot open: no sample rate";
-        } else if (mConverted.setRate(sampleRate, &cause)) {
+        } else if (mReader.setRate(sampleRate, &cause)) {
             mRate = sampleRate;
             mPacing.start(sampleRate);
             return 0;
@@ -50,13 +44,13 @@ public:
         // Decoded before the wait, so that a broken file fails at once.
         while (mPending.size() - mHead < count && !mEnded) {
             std::string cause;
-            const long got = mConverted.read(mBlock.data(), kDecodeBlock, &cause);
+            const long got = mReader.read(mBlock.data(), kDecodeBlock, &cause);
             if (got < 0) {
                 fail(cause);
                 return android::UNKNOWN_ERROR;
             }
             mEnded = got == 0;
-            for (long i = 0; i < got; ++i) mPending.push_back(toPcm16(mBlock[static_cast<size_t>(i)]));
+            mPending.insert(mPending.end(), mBlock.begin(), mBlock.begin() + got);
         }
         const size_t n = mPacing.next(count);
         const size_t fromFile = std::min(n, mPending.size() - mHead);
@@ -95,9 +89,8 @@ private:
         mFailure = cause;
     }
 
-    const std::unique_ptr<SoundFileInput> mInput;
-    ResampledInput mConverted;
-    std::vector<float> mBlock;
+    RecordingReader mReader;
+    std::vector<int16_t> mBlock;
     std::vector<int16_t> mPending;  // converted samples not delivered yet, from mHead on
     size_t mHead = 0;
     bool mEnded = false;
