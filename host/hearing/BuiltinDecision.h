@@ -1,0 +1,27 @@
+// HearFreqIdx's decision, made for every code at once: the masked read-out, its two
+// peaks, each looked up as a code. One spectrum decides.
+//
+// One guard is added. The masked bands end at entry 200 (code 17), so a tone above it
+// (codes 18 and up, or what a code above half the output rate folds back to) leaks
+// into entry 200 and would be taken for code 17. A code is not taken when the
+// unmasked read-out shows a tone at least kGuardLevels above it beyond the bands.
+#pragma once
+#include "host/hearing/Decoder.h"
+
+namespace korvo {
+namespace host {
+
+class BuiltinDecision : public Decoder {
+public:
+    static constexpr float kGuardLevels = 12.0f;  // 14.4 dB; noise alone rarely stands so far out
+
+    CodeSet hear(Ear& ear) override;
+    void reset() override {}
+
+    // Whether the code of masked entry `entry` (level `level`) is leakage of a stronger
+    // tone above the bands, by the unmasked read-out `levels`.
+    static bool leakFromAbove(const float* levels, float level);
+};
+
+}  // namespace host
+}  // namespace korvo

@@ -1,0 +1,51 @@
+// A listener that hears a recording offline, as fast as the processor allows, the way
+// a live device hears it: the same warm-up, the same calibration for --level auto,
+// the simulated capture and analysis (SimulatedEar), the decoder and its events.
+#pragma once
+#include <memory>
+
+#include "host/hearing/Calibration.h"
+#include "host/hearing/CodeEvents.h"
+#include "host/hearing/Decoder.h"
+#include "host/hearing/SimulatedEar.h"
+#include "host/hearing/StepClock.h"
+
+namespace korvo {
+namespace host {
+
+class OfflineListener {
+public:
+    OfflineListener(DecoderKind kind, int phase);
+
+    // A fixed detection level, or calibration on the room after the warm-up.
+    void setLevel(int level) { mEar.setDetectionLevel(level); }
+    void calibrateFirst() { mCalibrating = true; }
+
+    // One capture step with the next frame of 512 samples: the codes that begin to be
+    // heard (none during the warm-up and the calibration).
+    CodeSet step(const int16_t* frame);
+    // Codes heard at the last step.
+    CodeSet heardNow() const { return mHeard; }
+
+    int64_t steps() const { return mEar.steps(); }
+    int64_t analysedFrame() const { return mEar.analysedFrame(); }
+    double seconds() const { return stepSeconds(steps()); }
+    int level() { return mEar.detectionLevel(); }
+    // What the calibration proposed, once it has run.
+    const Calibration::Proposal& proposal() const { return mProposal; }
+    bool calibrated() const { return mCalibrated; }
+
+private:
+    DecoderKind mKind;
+    SimulatedEar mEar;
+    std::unique_ptr<Decoder> mDecoder;
+    CodeEvents mEvents;
+    CodeSet mHeard = 0;
+    bool mCalibrating = false;
+    bool mCalibrated = false;
+    Calibration mCalibration;
+    Calibration::Proposal mProposal;
+};
+
+}  // namespace host
+}  // namespace korvo
