@@ -37,28 +37,19 @@ struct DemoOptions {
     bool snrGiven = false;
     int toneMs = 300;
     int timeoutMs = 8000;
+    LevelChoice level;
+    std::string decoder = "host";
 };
 
-// The noisiest room a microphone takes is 0 dBFS of noise, the tone's RMS lies about 9.9 dB below.
-constexpr double kMinSnr = -9.0;
+// In noise the room carries the speakers to the microphones 20 dB down, so that the
+// noise of the lowest SNR (-15 dB) stays at -15 dBFS, clear of clipping.
+constexpr double kNoisyRoomGainDb = -20.0;
+constexpr double kMinSnr = -15.0;
 // A device that has not printed "ready" after this long is taken as stuck.
 constexpr int64_t kStartupMs = 10000;
 
 // RMS of the tone engine's sine (peak 14744 of 32768) in dBFS, 0 dBFS being an RMS of 32768.
 const double kToneDbfs = 20.0 * std::log10(14744.0 / 32768.0 / std::sqrt(2.0));
-
-// Mean level of one spectrum bin under white noise of the given dBFS: each bin of
-// the frame's transform of noise with RMS s (full scale 1) has an RMS magnitude of
-// sqrt(frame length) * s, which the analyser divides by its magnitude divisor.
-double noiseBinLevel(double noiseDbfs) {
-    double magnitude = std::sqrt(double(korvo::kFrameSamples)) * std::pow(10.0, noiseDbfs / 20.0) /
-                       double(korvo::kMagnitudeDivisor);
-    return 100.0 * (1.0 + std::log10(magnitude) / 6.0);
-}
-
-// Detection level for that noise: 10 units (12 dB) above the mean bin level, where
-// a noise bin almost never reaches, so noise alone is not taken for a code.
-int detectionLevelFor(double noiseDbfs) { return static_cast<int>(std::ceil(noiseBinLevel(noiseDbfs) + 10.0)); }
 
 std::string uniqueRoomName() {
     return "demo-" + std::to_string(getpid()) + "-" + std::to_string(monotonicMs() % 100000000);
@@ -70,7 +61,8 @@ const char* const kWhoName[2] = {"listener", "speaker"};
 // What happened in one round, from both devices' lines.
 struct Round {
     int said = -1, heard = -1, answered = -1, answerHeard = -1;  // codes
-    long long saidAt = -1, answeredAt = -1;
+    long long saidAt = -1, answeredAt = -1;  // the latest attempts
+    long long firstSaidAt = -1;
 };
 
 class DemoRun {
@@ -97,15 +89,15 @@ public:
         mStart = monotonicMs();
         std::string noise = "no noise";
         if (mOpt.snrGiven) {
-            mNoiseDbfs = kToneDbfs - mOpt.snr;
+            mNoiseDbfs = kToneDbfs + kNoisyRoomGainDb - mOpt.snr;
             char text[128];
-            snprintf(text, sizeof text, "noise %.1f dBFS (SNR %.1f dB), detection level %d", mNoiseDbfs, mOpt.snr,
-                     detectionLevelFor(mNoiseDbfs));
+            snprintf(text, sizeof text, "noise %.1f dBFS (SNR %.1f dB)", mNoiseDbfs, mOpt.snr);
             noise = text;
         }
         const std::string where = freshRoom ? "in room " + mRoom : "on mic " + mMic + ", speaker " + mSpeaker;
-        infof("demo %s: %s, acknowledgement %s, tones of %d ms, %s\n", where.c_str(), plural(mOpt.rounds, "round").c_str(),
-              mOpt.noAck ? "off" : "on", mOpt.toneMs, noise.c_str());
+        infof("demo %s: %s, acknowledgement %s, tones of %d ms, %s, %s decision%s\n", where.c_str(),
+              plural(mOpt.rounds, "round").c_str(), mOpt.noAck ? "off" : "on", mOpt.toneMs, noise.c_str(),
+              mOpt.decoder.c_str(), levelArgument().empty() ? "" : (", " + levelArgument().substr(2)).c_str());
 
         const bool started = startDevice(kListener);
         if (started) pump();
@@ -122,16 +114,22 @@ private:
                                          std::to_string(mOpt.toneMs), "--timeout-ms", std::to_string(mOpt.timeoutMs),
                                          "--mic", mMic, "--speaker", mSpeaker};
         if (mOpt.noAck) args.push_back("--no-ack");
-        if (mOpt.snrGiven) args.push_back("--level=" + std::to_string(detectionLevelFor(mNoiseDbfs)));
+        args.push_back("--decoder=" + mOpt.decoder);
+        if (!levelArgument().empty()) args.push_back(levelArgument());
         for (int i = 0; i < mCommon.verbose; ++i) args.push_back("-v");
         if (!mCommon.plugin.empty()) args.push_back("--plugin=" + mCommon.plugin);
         EnvList env;
-        // Each device's microphone hears noise of its own.
-        env.emplace_back("KORVO_SIM_SEED", who == kListener ? "11" : "22");
+        // Each device's microphone hears noise of its own, new in every run.
+        env.emplace_back("KORVO_SIM_SEED", std::to_string(2 * (getpid() % 1000000) + who + 1));
         // The demo decides the noise: none unless --snr asks for it (an empty value is none).
         char level[32] = "";
-        if (mOpt.snrGiven) snprintf(level, sizeof level, "%.2f", mNoiseDbfs);
+        char gain[32] = "";
+        if (mOpt.snrGiven) {
+            snprintf(level, sizeof level, "%.2f", mNoiseDbfs);
+            snprintf(gain, sizeof gain, "%.1f", kNoisyRoomGainDb);
+        }
         env.emplace_back("KORVO_SIM_NOISE", level);
+        env.emplace_back("KORVO_SIM_GAIN", gain);
         std::string error;
         ChildProcess::Options options;
         options.ownGroup = true;  // Ctrl-C reaches the demo, which stops its devices
@@ -142,6 +140,12 @@ private:
         mOpen[who] = true;
         mQuietUntil[who] = monotonicMs() + kStartupMs;
         return true;
+    }
+
+    // --level for the devices: as given; in noise without one, calibrated on the room.
+    std::string levelArgument() const {
+        if (mOpt.level.given) return mOpt.level.automatic ? "--level=auto" : "--level=" + std::to_string(mOpt.level.value);
+        return mOpt.snrGiven ? "--level=auto" : "";
     }
 
     // The longest a working device stays silent: its peer's hearing (one timeout), a tone,
@@ -209,8 +213,10 @@ private:
         } else if (p.event == "said") {
             (who == kSpeaker ? r.said : r.answered) = code;
             (who == kSpeaker ? r.saidAt : r.answeredAt) = t;
-            event(JsonEvent("said").add("device", kWhoName[who]).add("round", round).add("code", code), t, who,
-                  "says  code %2d (%5d Hz)", code, codeHz(code));
+            if (who == kSpeaker && r.firstSaidAt < 0) r.firstSaidAt = t;
+            const long long attempt = p.get("attempt", 1);
+            event(JsonEvent("said").add("device", kWhoName[who]).add("round", round).add("code", code).add("attempt", attempt),
+                  t, who, "says  code %2d (%5d Hz)%s", code, codeHz(code), attempt > 1 ? " again" : "");
         } else if (p.event == "heard") {
             const long long toneAt = who == kListener ? r.saidAt : r.answeredAt;
             const long long oneWay = toneAt >= 0 ? t - toneAt : p.get("waited");
@@ -218,6 +224,8 @@ private:
             event(JsonEvent("heard").add("device", kWhoName[who]).add("round", round).add("code", code).add("one_way_ms", oneWay),
                   t, who, "hears code %2d (%5d Hz), one way %lld ms", code, codeHz(code), oneWay);
             exchangeDone(round, t);
+        } else if (p.event == "missed") {
+            show(t, who, "missed code " + std::to_string(code) + " (" + std::to_string(codeHz(code)) + " Hz)");
         } else if (p.event == "timeout") {
             show(t, who, "did not hear code " + std::to_string(code) + " (" + std::to_string(codeHz(code)) + " Hz) within " +
                              std::to_string(p.get("waited")) + " ms");
@@ -233,13 +241,13 @@ private:
         const bool complete = mOpt.noAck ? heard : heard && r.answered == r.said + 1 && r.answerHeard == r.answered;
         if (!complete || mCounted.count(round)) return;
         mCounted.insert({round, true});
-        const long long roundTrip = t - r.saidAt;
+        const long long roundTrip = t - r.firstSaidAt;
         mLatencies.push_back(roundTrip);
         JsonEvent e("exchange");
         e.add("round", round).add("code", r.said).add("round_trip_ms", roundTrip);
         if (!mOpt.noAck) e.add("answer", r.answered);
         event(e, t, kSpeaker, mOpt.noAck ? "exchange %d complete, code said to code heard in %lld ms"
-                                         : "exchange %d complete, round trip %lld ms (code said to its answer heard)",
+                                         : "exchange %d complete, round trip %lld ms (code first said to its answer heard)",
               round, roundTrip);
     }
 
@@ -352,16 +360,18 @@ Command addDemoCommand(CLI::App& app, CommonOptions& common) {
                options->snr = v;
                options->snrGiven = true;
            },
-           "add white noise to both microphones, this many dB below the tone, and raise the detection level "
-           "above it (default: no noise); below about 15 dB code 0 is lost first, its band catching only a "
-           "leak of its tone")
+           "add white noise to both microphones: the tone's power over the noise's, in dB (default: no "
+           "noise); the devices then calibrate their detection level on the room (--level auto)")
         ->check(finiteRange(kMinSnr, 120.0));
     sub->add_option("--tone-ms", options->toneMs, "duration of each tone in milliseconds")
         ->check(CLI::Range(50, 5000))
         ->capture_default_str();
-    sub->add_option("--timeout-ms", options->timeoutMs, "how long a device waits for each code")
+    sub->add_option("--timeout-ms", options->timeoutMs,
+                    "how long a round may take, its code said again as often as it needs")
         ->check(CLI::Range(500, 600000))
         ->capture_default_str();
+    addLevelOption(sub, &options->level, "the devices' detection level (default: auto with --snr, else the plug-in's)");
+    addDecoderOption(sub, &options->decoder);
     // Both devices use these routes instead of the fresh room (e.g. sim:lab, which a monitor can join).
     addRouteOptions(sub, common, "the fresh room", "the fresh room");
     return {sub, [&common, options] {

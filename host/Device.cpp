@@ -24,7 +24,8 @@ bool Device::open(const DeviceSettings& settings, std::string* error) {
     // The capture ring starts with whatever memory held, and the analysis thread takes its
     // slots in turn: until every slot holds captured sound, a read-out can show a code
     // nobody said. Capture steps first fill the ring and let the analysis catch up.
-    stepUntil(monotonicMs() + kWarmUpMs);
+    mSteps = 0;
+    for (int i = 0; i < kWarmUpSteps && interruption() == Outcome::Done; ++i) step();
     return true;
 }
 
@@ -43,13 +44,9 @@ Outcome Device::interruption() {
     return Outcome::Done;
 }
 
-Outcome Device::hearUntil(int code, int64_t deadlineMs) {
-    for (;;) {
-        const Outcome stop = interruption();
-        if (stop != Outcome::Done) return stop;
-        if (mMeter->HearFreqIdx(code) == code) return Outcome::Done;
-        if (monotonicMs() >= deadlineMs) return Outcome::TimedOut;
-    }
+void Device::step() {
+    mMeter->processAudio();
+    ++mSteps;
 }
 
 void Device::sayCode(int code, int durationMs) {
@@ -61,7 +58,7 @@ Outcome Device::stepUntil(int64_t deadlineMs) {
     while (monotonicMs() < deadlineMs) {
         const Outcome stop = interruption();
         if (stop != Outcome::Done) return stop;
-        mMeter->processAudio();
+        step();
     }
     return interruption();
 }

@@ -6,6 +6,7 @@
 
 #include "host/Plugin.h"
 #include "host/RouteGuard.h"
+#include "host/hearing/StepClock.h"
 #include "interface/SoundMeter_vir.h"
 
 namespace korvo {
@@ -14,9 +15,6 @@ namespace host {
 // Time a tone needs after its duration to be out of the room: the fade-out block
 // (20 ms), the route's latency and some slack for a loaded machine.
 constexpr int kToneTailMs = 250;
-// Capture before a device listens: five frames of 11.6 ms fill the ring, and the analysis
-// thread, one frame per 20 ms turn, takes frames that were captured.
-constexpr int kWarmUpMs = 150;
 
 struct DeviceSettings {
     int role = 0;           // 1 listener, 2 speaker, 3 both
@@ -25,6 +23,7 @@ struct DeviceSettings {
     int level = 0;
     RouteUse routes;        // the routes the command uses: checked first, then watched
 };
+
 
 // How a wait ended: its goal (heard, or the time reached), time up, Ctrl-C, or a route
 // that failed (its line already printed).
@@ -44,9 +43,10 @@ public:
 
     SoundMeter_vir& meter() { return *mMeter; }
 
-    // HearFreqIdx(code), one capture step per call, until heard (Done), the deadline
-    // (monotonic ms), Ctrl-C or a failed route.
-    Outcome hearUntil(int code, int64_t deadlineMs);
+    // One capture step (processAudio).
+    void step();
+    // Capture steps made since the microphone started: each reads one frame.
+    int64_t steps() const { return mSteps; }
     // Says one code. The saying gate is re-armed first (speaker state 0): on its own
     // the state machine lets a device say once per exchange, and a device running
     // several rounds has to open it again each time.
@@ -61,6 +61,7 @@ private:
     const Plugin& mPlugin;
     RouteWatch& mWatch;
     SoundMeter_vir* mMeter = nullptr;
+    int64_t mSteps = 0;
 };
 
 // The exit status that goes with an outcome: 0 done, 1 time up or a failed route, 130 Ctrl-C.

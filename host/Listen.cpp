@@ -1,18 +1,17 @@
-// soundmeter listen: hears one given code (HearFreqIdx), or reports every code
-// that sounds (the masked read-out and the two-peak detector). On a file it ends a
-// moment after the file does, and on a terminal it shows where it is in the file.
+// soundmeter listen: hears one given code, or reports every code that begins to sound,
+// with its time on the microphone's clock (the time in a recording). On a file it ends
+// a moment after the file does, and on a terminal it shows where it is in the file.
 #include <CLI/CLI.hpp>
 
 #include <korvo/platform/Routes.h>
 
 #include "host/Clock.h"
 #include "host/CodePlan.h"
-#include "host/CodeTracker.h"
+#include "host/Hearing.h"
 #include "host/JsonEvent.h"
 #include "host/Options.h"
 #include "host/Output.h"
 #include "host/Session.h"
-#include "host/Spectrum.h"
 
 namespace korvo {
 namespace host {
@@ -20,8 +19,8 @@ namespace {
 
 struct ListenOptions {
     int code = -1;  // -1: report every code
-    int level = 0;
-    bool levelGiven = false;
+    LevelChoice level;
+    std::string decoder = "host";
     double seconds = 10.0;  // 0: until Ctrl-C
 };
 
@@ -63,33 +62,29 @@ int64_t deadlineOf(int64_t start, double seconds) {
     return seconds > 0 ? start + static_cast<int64_t>(seconds * 1000.0) : INT64_MAX;
 }
 
-int listenForCode(Session& session, const ListenOptions& o) {
-    if (!codeHearable(o.code)) infof("note: code %d (%d Hz) %s\n", o.code, codeHz(o.code), codeReach(o.code));
+int listenForCode(Session& session, Hearing& hearing, const ListenOptions& o) {
+    if (!hears(hearing.decoder(), o.code)) {
+        infof("note: code %d (%d Hz) %s\n", o.code, codeHz(o.code), codeReach(o.code, hearing.decoder()));
+    }
     infof("listening for code %d (%d Hz)\n", o.code, codeHz(o.code));
-    SoundMeter_vir& meter = session.meter();
     FileWatch file;
     const int64_t start = monotonicMs();
     const int64_t deadline = deadlineOf(start, o.seconds);
     Outcome outcome = Outcome::TimedOut;
     bool fileOver = false;
     for (int64_t now = start; now < deadline; now = monotonicMs()) {
-        const Outcome stop = session.interruption();
-        if (stop != Outcome::Done) {
-            outcome = stop;
-            break;
-        }
-        if (meter.HearFreqIdx(o.code) == o.code) {
-            outcome = Outcome::Done;
-            break;
-        }
+        if ((outcome = session.interruption()) != Outcome::Done) break;
+        if (hearing.step() & codeBit(o.code)) break;
+        outcome = Outcome::TimedOut;
         if ((fileOver = file.over(now))) break;
     }
     const int64_t waited = monotonicMs() - start;
+    const double at = hearing.seconds();
     file.clear();
     session.close();
     if (outcome == Outcome::Done) {
-        resultf(JsonEvent("heard").add("code", o.code).add("hz", codeHz(o.code)).add("listened_ms", waited),
-                "heard code %d (%d Hz) after %lld ms of listening\n", o.code, codeHz(o.code),
+        resultf(JsonEvent("heard").add("code", o.code).add("hz", codeHz(o.code)).add("t_s", at).add("listened_ms", waited),
+                "heard code %d (%d Hz) at %.3f s, after %lld ms of listening\n", o.code, codeHz(o.code), at,
                 static_cast<long long>(waited));
         return 0;
     }
@@ -102,11 +97,8 @@ int listenForCode(Session& session, const ListenOptions& o) {
     return 1;
 }
 
-int reportCodes(Session& session, const ListenOptions& o) {
+int reportCodes(Session& session, Hearing& hearing, const ListenOptions& o) {
     infof("listening for every code\n");
-    SoundMeter_vir& meter = session.meter();
-    CodeTracker tracker;
-    SpectrumLook look;
     FileWatch file;
     int count = 0;
     Outcome outcome = Outcome::Done;
@@ -114,16 +106,12 @@ int reportCodes(Session& session, const ListenOptions& o) {
     const int64_t deadline = deadlineOf(start, o.seconds);
     for (int64_t now = start; now < deadline && !file.over(now); now = monotonicMs()) {
         if ((outcome = session.interruption()) != Outcome::Done) break;
-        meter.processAudio();
-        lookAtSpectrum(meter, &look);
-        const uint64_t fresh = tracker.update(monotonicMs(), look.codeFirst, look.codeSecond);
+        const CodeSet begun = hearing.step();
         for (int c = 0; c < kCodeCount; ++c) {
-            if (!(fresh & (uint64_t{1} << c))) continue;
+            if (!(begun & codeBit(c))) continue;
             ++count;
-            const double t = (monotonicMs() - start) / 1000.0;
             file.clear();
-            resultf(JsonEvent("heard").add("code", c).add("hz", codeHz(c)).add("t_s", t), "%8.3f s  heard code %d (%d Hz)\n",
-                    t, c, codeHz(c));
+            printHeard(c, hearing.seconds());
         }
     }
     const double elapsed = (monotonicMs() - start) / 1000.0;
@@ -136,14 +124,20 @@ int reportCodes(Session& session, const ListenOptions& o) {
 }
 
 int runListen(const CommonOptions& common, const ListenOptions& o) {
+    DecoderKind kind = DecoderKind::Host;
+    parseDecoder(o.decoder, &kind);
     Session session(common);
     DeviceSettings settings;
     settings.role = 1;  // listener without acknowledgement: hearing changes nothing it needs
-    settings.setLevel = o.levelGiven;
-    settings.level = o.level;
     settings.routes.mic = true;
     if (int status = session.open(settings)) return status;
-    return o.code >= 0 ? listenForCode(session, o) : reportCodes(session, o);
+    Hearing hearing(session.device(), kind);
+    const Outcome level = hearing.applyLevel(o.level);
+    if (level != Outcome::Done) {
+        session.close();
+        return exitStatusOf(level);
+    }
+    return o.code >= 0 ? listenForCode(session, hearing, o) : reportCodes(session, hearing, o);
 }
 
 }  // namespace
@@ -154,11 +148,12 @@ Command addListenCommand(CLI::App& app, CommonOptions& common) {
         "listen",
         "Listen for one code (--code: exit 0 when heard, 1 when time is up or the file ended), or report every "
         "code heard, one line each. On a file, ends when the file does.");
-    sub->add_option("--code", options->code, "code to listen for, 0..39 (only 0..17 can be heard)")
+    sub->add_option("--code", options->code, "code to listen for, 0..39 (0..22 can be heard, 0..17 by builtin)")
         ->check(CLI::Range(0, kCodeCount - 1));
-    addLevelOption(sub, &options->level, &options->levelGiven,
+    addLevelOption(sub, &options->level,
                    "detection level: spectrum levels at or below it count as silence (level 100 = full scale, "
                    "1 unit = 1.2 dB)");
+    addDecoderOption(sub, &options->decoder);
     sub->add_option("--seconds", options->seconds, "how long to listen; 0: until Ctrl-C (or the file's end)")
         ->check(finiteRange(0.0, 86400.0))
         ->capture_default_str();

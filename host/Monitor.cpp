@@ -7,19 +7,18 @@
 
 #include "host/Clock.h"
 #include "host/CodePlan.h"
-#include "host/CodeTracker.h"
+#include "host/Hearing.h"
 #include "host/Options.h"
 #include "host/Output.h"
 #include "host/Session.h"
-#include "host/Spectrum.h"
 
 namespace korvo {
 namespace host {
 namespace {
 
 struct MonitorOptions {
-    int level = 0;
-    bool levelGiven = false;
+    LevelChoice level;
+    std::string decoder = "host";
     double seconds = 0.0;  // 0: until Ctrl-C
 };
 
@@ -35,7 +34,7 @@ bool fileEnded(int64_t now) {
     return endedAt >= 0 && now >= endedAt + kFileTailMs;
 }
 constexpr int kBarWidth = 50;  // two level units per character, level 100 = full scale
-constexpr int kFrameLines = kHearableCodes + 4;
+constexpr int kFrameLines = kHostCodes + 4;
 
 std::string bar(float level, int detection) {
     int n = level <= 0.0f ? 0 : static_cast<int>(level / 2.0f);
@@ -47,7 +46,7 @@ std::string bar(float level, int detection) {
     return s;
 }
 
-void drawFrame(bool ansi, bool first, SoundMeter_vir& meter, const SpectrumLook& look, int heard,
+void drawFrame(bool ansi, bool first, SoundMeter_vir& meter, const float* levels, int bins, CodeSet heard,
                double elapsed) {
     const char* eol = ansi ? "\x1b[K\n" : "\n";
     std::string frame;
@@ -55,52 +54,51 @@ void drawFrame(bool ansi, bool first, SoundMeter_vir& meter, const SpectrumLook&
     char line[256];
     int detection = meter.getDetectionLevel();
     snprintf(line, sizeof line, "%6.1f s  detection level %d  %s%s", elapsed, detection,
-             look.bins == 0 ? "(no spectrum yet)" : "", eol);
+             bins == 0 ? "(no spectrum yet)" : "", eol);
     frame += line;
-    for (int c = 0; c < kHearableCodes; ++c) {
-        float v = look.levels[codeIndex(c)];
+    for (int c = 0; c < kHostCodes; ++c) {
+        const float v = levels[codeIndex(c)];
         snprintf(line, sizeof line, "code %2d %5d Hz %s %5.1f%s", c, codeHz(c), bar(v, detection).c_str(), v, eol);
         frame += line;
     }
-    snprintf(line, sizeof line, "codes 18..22 masked out by the read-out, 23..39 beyond the spectrum%s", eol);
+    snprintf(line, sizeof line, "bars: each code's own bin; codes 23..39 lie above the spectrum%s", eol);
     frame += line;
-    if (heard >= 0) {
-        snprintf(line, sizeof line, "heard: code %d (%d Hz)%s", heard, codeHz(heard), eol);
-    } else {
-        snprintf(line, sizeof line, "heard: -%s", eol);
+    std::string names;
+    for (int c = 0; c < kCodeCount; ++c) {
+        if (heard & codeBit(c)) names += (names.empty() ? "" : ", ") + std::to_string(c) + " (" + std::to_string(codeHz(c)) + " Hz)";
     }
+    snprintf(line, sizeof line, "heard: %s%s", names.empty() ? "-" : ("code " + names).c_str(), eol);
     frame += line;
     frame += ansi ? "\x1b[K\n" : "\n";
     outf("%s", frame.c_str());
 }
 
 int runMonitor(const CommonOptions& common, const MonitorOptions& o) {
+    DecoderKind kind = DecoderKind::Host;
+    parseDecoder(o.decoder, &kind);
     Session session(common);
     DeviceSettings settings;
     settings.role = 1;
-    settings.setLevel = o.levelGiven;
-    settings.level = o.level;
     settings.routes.mic = true;
     if (int status = session.open(settings)) return status;
     SoundMeter_vir& meter = session.meter();
+    Hearing hearing(session.device(), kind);
+    Outcome outcome = hearing.applyLevel(o.level);
     // Redraw in place on a terminal; elsewhere (a pipe, a file) frames follow each other.
     bool ansi = hostOutputIsTerminal();
     if (ansi) outf("\x1b[?25l");  // no blinking cursor over the bars
 
-    CodeTracker tracker;
-    SpectrumLook look;
+    float levels[korvo::kSpectrumBins] = {};
     int64_t start = monotonicMs();
     int64_t end = o.seconds > 0 ? start + static_cast<int64_t>(o.seconds * 1000.0) : INT64_MAX;
     int64_t nextDraw = start;
     bool first = true;
-    Outcome outcome = Outcome::Done;
-    for (int64_t now = start; now < end && !fileEnded(now); now = monotonicMs()) {
+    for (int64_t now = start; outcome == Outcome::Done && now < end && !fileEnded(now); now = monotonicMs()) {
         if ((outcome = session.interruption()) != Outcome::Done) break;
-        meter.processAudio();
-        lookAtSpectrum(meter, &look);
-        tracker.update(monotonicMs(), look.codeFirst, look.codeSecond);
+        hearing.step();
         if (now >= nextDraw) {
-            drawFrame(ansi, first, meter, look, tracker.current(), (now - start) / 1000.0);
+            const int bins = meter.getSpectrumData(levels);
+            drawFrame(ansi, first, meter, levels, bins, hearing.heardNow(), (now - start) / 1000.0);
             first = false;
             nextDraw = now + kRefreshMs;
         }
@@ -116,10 +114,10 @@ Command addMonitorCommand(CLI::App& app, CommonOptions& common) {
     auto options = std::make_shared<MonitorOptions>();
     CLI::App* sub = app.add_subcommand(
         "monitor",
-        "Live view of the read-out: the level of each hearable code's band as a bar, the detection level "
-        "and the code heard; Ctrl-C ends it.");
-    addLevelOption(sub, &options->level, &options->levelGiven,
-                   "detection level: spectrum levels at or below it count as silence");
+        "Live view of the read-out: the level of each code's own bin as a bar, the detection level and the "
+        "codes heard; Ctrl-C ends it.");
+    addLevelOption(sub, &options->level, "detection level: spectrum levels at or below it count as silence");
+    addDecoderOption(sub, &options->decoder);
     sub->add_option("--seconds", options->seconds, "stop after this many seconds; 0: until Ctrl-C (or the file's end)")
         ->check(finiteRange(0.0, 86400.0))
         ->capture_default_str();

@@ -42,15 +42,38 @@ CLI::Validator finiteRange(double lo, double hi) {
         "NUMBER in [" + number(lo) + " - " + number(hi) + "]", "finite range");
 }
 
-void addLevelOption(CLI::App* sub, int* level, bool* given, const char* help) {
-    sub->add_option_function<int>(
+void addLevelOption(CLI::App* sub, LevelChoice* level, const char* help, bool allowAuto) {
+    std::string text = help;
+    if (allowAuto) text += "; auto: listen to the room first and take the level it proposes (as calibrate)";
+    sub->add_option_function<std::string>(
            "--level",
-           [level, given](const int& v) {
-               *level = v;
-               *given = true;
+           [level](const std::string& v) {
+               level->given = true;
+               level->automatic = v == "auto";
+               if (!level->automatic) level->value = std::stoi(v);
            },
-           help)
-        ->check(CLI::Range(kMinLevel, kMaxLevel));
+           text)
+        ->type_name(allowAuto ? "LEVEL|auto" : "LEVEL")
+        ->check(CLI::Validator(
+            [allowAuto](std::string& v) -> std::string {
+                if (allowAuto && v == "auto") return {};
+                char* end = nullptr;
+                const long n = std::strtol(v.c_str(), &end, 10);
+                if (end == v.c_str() || *end != '\0') return "'" + v + "' is not a whole number" + (allowAuto ? " or auto" : "");
+                if (n < kMinLevel || n > kMaxLevel) {
+                    return "'" + v + "' is not within " + std::to_string(kMinLevel) + ".." + std::to_string(kMaxLevel);
+                }
+                return {};
+            },
+            "", "level"));
+}
+
+void addDecoderOption(CLI::App* sub, std::string* decoder) {
+    sub->add_option("--decoder", *decoder,
+                    "how codes are heard: host (each code's own bin, over one or more analysed frames) or builtin "
+                    "(the plug-in's HearFreqIdx decision: one masked spectrum, codes 0..17)")
+        ->check(CLI::IsMember({"host", "builtin"}))
+        ->capture_default_str();
 }
 
 void addRouteOptions(CLI::App* sub, CommonOptions& common, const char* micDefault, const char* speakerDefault) {

@@ -33,10 +33,20 @@ struct Command {
 constexpr int kMinLevel = -100;
 constexpr int kMaxLevel = 200;
 
+// --level as given: a number, "auto" (calibrate on the room first), or nothing (the
+// plug-in's own level stays).
+struct LevelChoice {
+    bool given = false;
+    bool automatic = false;
+    int value = 0;
+};
+
 // A number that is finite and within [lo, hi] ("nan", "inf" and the like are refused).
 CLI::Validator finiteRange(double lo, double hi);
-// --level, stored in *level with *given set.
-void addLevelOption(CLI::App* sub, int* level, bool* given, const char* help);
+// --level L (and "auto" where `allowAuto`).
+void addLevelOption(CLI::App* sub, LevelChoice* level, const char* help, bool allowAuto = true);
+// --decoder host|builtin.
+void addDecoderOption(CLI::App* sub, std::string* decoder);
 // Adds --mic and --speaker, checked as ROUTE texts; the defaults are named in their help.
 void addRouteOptions(CLI::App* sub, CommonOptions& common, const char* micDefault = "KORVO_MIC, else null",
                      const char* speakerDefault = "KORVO_SPEAKER, else null");
@@ -48,6 +58,8 @@ Command addSweepCommand(CLI::App& app, CommonOptions& common);
 Command addHandshakeCommand(CLI::App& app, CommonOptions& common);
 Command addMonitorCommand(CLI::App& app, CommonOptions& common);
 Command addDevicesCommand(CLI::App& app, CommonOptions& common);
+Command addScanCommand(CLI::App& app, CommonOptions& common);
+Command addCalibrateCommand(CLI::App& app, CommonOptions& common);
 
 }  // namespace host
 }  // namespace korvo

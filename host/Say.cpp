@@ -26,7 +26,8 @@ int runSay(const CommonOptions& common, const SayOptions& o) {
     settings.routes.speaker = true;
     if (int status = session.open(settings)) return status;
     noteSilentSpeaker();
-    if (!codeHearable(o.code)) infof("note: code %d (%d Hz) %s\n", o.code, codeHz(o.code), codeReach(o.code));
+    const std::string truth = codeTruth(o.code, static_cast<int>(korvo::platform::outputRateOf(korvo::platform::speakerRoute())));
+    if (!truth.empty()) infof("note: %s\n", truth.c_str());
 
     const int64_t start = monotonicMs();
     session.device().sayCode(o.code, o.ms);
@@ -50,7 +51,7 @@ void noteSilentSpeaker() {
 Command addSayCommand(CLI::App& app, CommonOptions& common) {
     auto options = std::make_shared<SayOptions>();
     CLI::App* sub = app.add_subcommand("say", "Say one code (role speaker) and wait until its tone has ended.");
-    sub->add_option("CODE", options->code, "code to say, 0..39 (only 0..17 can be heard)")
+    sub->add_option("CODE", options->code, "code to say, 0..39 (every listener hears 0..17; the host's decision also 18..22)")
         ->required()
         ->check(CLI::Range(0, kCodeCount - 1));
     sub->add_option("--ms", options->ms, "tone duration in milliseconds")

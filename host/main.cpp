@@ -43,7 +43,7 @@ int main(int argc, char** argv) {
     std::vector<Command> commands = {
         addDemoCommand(app, common),   addListenCommand(app, common),    addSayCommand(app, common),
         addSweepCommand(app, common),  addHandshakeCommand(app, common), addMonitorCommand(app, common),
-        addDevicesCommand(app, common),
+        addDevicesCommand(app, common), addScanCommand(app, common),    addCalibrateCommand(app, common),
     };
     for (Command& c : commands) addCommonFlags(c.app, common);
 
@@ -57,7 +57,7 @@ int main(int argc, char** argv) {
             if (rest.front().rfind("-", 0) == 0) {
                 errf("unknown option '%s'", rest.front().c_str());
             } else {
-                errf("unknown command '%s' (expected demo, listen, say, sweep, handshake, monitor or devices)",
+                errf("unknown command '%s' (expected demo, listen, say, sweep, handshake, monitor, devices, scan or calibrate)",
                      rest.front().c_str());
             }
         } else {

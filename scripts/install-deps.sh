@@ -2,6 +2,7 @@
 # Installs, from Debian's packages, whatever the build and the tests need and is missing.
 #   scripts/install-deps.sh            the default toolchain (g++)
 #   scripts/install-deps.sh clang ...  also clang, for the clang preset
+#   scripts/install-deps.sh envelope   also gnuplot, which draws the envelope's plots
 set -euo pipefail
 
 packages=(
@@ -17,6 +18,7 @@ packages=(
 )
 for preset in "$@"; do
   if [ "$preset" = clang ]; then packages+=(clang); fi
+  if [ "$preset" = envelope ]; then packages+=(gnuplot-nox); fi
 done
 
 missing=()
