@@ -33,6 +33,7 @@ ChildProcess::~ChildProcess() {
     for (int fd : mFd) {
         if (fd >= 0) close(fd);
     }
+    if (mStdin >= 0) close(mStdin);
 }
 
 bool ChildProcess::start(const std::string& path, const std::vector<std::string>& args, const EnvList& env,
@@ -69,6 +70,14 @@ bool ChildProcess::start(const std::string& path, const std::vector<std::string>
     }
     int pipes[2][2] = {{-1, -1}, {-1, -1}};
     const int count = options.captureStderr ? 2 : 1;
+    int feed[2] = {-1, -1};
+    if (options.stdinPipe && input < 0) {
+        if (pipe2(feed, O_CLOEXEC) != 0) {
+            if (error) *error = std::string("cannot make a pipe: ") + strerror(errno);
+            return false;
+        }
+        input = feed[0];
+    }
     for (int i = 0; i < count; ++i) {
         if (pipe2(pipes[i], O_CLOEXEC) != 0) {
             if (error) *error = std::string("cannot make a pipe: ") + strerror(errno);
@@ -78,6 +87,7 @@ bool ChildProcess::start(const std::string& path, const std::vector<std::string>
                 }
             }
             if (input >= 0) close(input);
+            if (feed[1] >= 0) close(feed[1]);
             return false;
         }
     }
@@ -104,8 +114,11 @@ bool ChildProcess::start(const std::string& path, const std::vector<std::string>
     if (pid < 0) {
         if (error) *error = std::string("cannot fork: ") + strerror(errno);
         for (int i = 0; i < count; ++i) close(pipes[i][0]);
+        if (feed[1] >= 0) close(feed[1]);
         return false;
     }
+    if (mStdin >= 0) close(mStdin);
+    mStdin = feed[1];
     mPid = pid;
     mFd[0] = pipes[0][0];
     mFd[1] = pipes[1][0];
@@ -153,6 +166,15 @@ std::vector<std::string> ChildProcess::takeLines() {
         mTaken = text.size();
     }
     return lines;
+}
+
+bool ChildProcess::writeLine(const std::string& line) {
+    if (mStdin < 0) return false;
+    const std::string text = line + "\n";
+    // A short line into an empty pipe is written whole; a child that is gone gives EPIPE,
+    // as SIGPIPE is ignored.
+    const ssize_t n = write(mStdin, text.data(), text.size());
+    return n == static_cast<ssize_t>(text.size());
 }
 
 void ChildProcess::sendSignal(int sig) {

@@ -22,6 +22,7 @@ public:
         bool ownGroup = false;       // a process group of its own: the terminal's Ctrl-C reaches only the parent
         int userId = -1;             // run as this user (and its group), when the parent may
         std::string stdinFile;       // when set, stdin reads this file instead
+        bool stdinPipe = false;      // else stdin is a pipe the parent writes (writeLine)
     };
 
     ChildProcess() = default;
@@ -44,6 +45,8 @@ public:
     // once the pipe is closed).
     std::vector<std::string> takeLines();
     bool outputOpen() const { return mFd[0] >= 0 || mFd[1] >= 0; }
+    // Writes one line to the child's stdin pipe; false when there is none or it is closed.
+    bool writeLine(const std::string& line);
 
     void sendSignal(int sig);
     // Reaps the child within timeoutMs; true with its exit status (128 + signal when a
@@ -55,6 +58,7 @@ public:
 private:
     pid_t mPid = -1;
     int mFd[2] = {-1, -1};  // stdout, stderr
+    int mStdin = -1;        // the write end of the child's stdin, when piped
     std::string mText[2];
     size_t mTaken = 0;  // stdout text already handed out as lines
 };

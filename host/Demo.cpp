@@ -99,7 +99,8 @@ public:
               plural(mOpt.rounds, "round").c_str(), mOpt.noAck ? "off" : "on", mOpt.toneMs, noise.c_str(),
               mOpt.decoder.c_str(), levelArgument().empty() ? "" : (", " + levelArgument().substr(2)).c_str());
 
-        const bool started = startDevice(kListener);
+        // Both start together and calibrate at once; they begin when both are ready.
+        const bool started = startDevice(kListener) && startDevice(kSpeaker);
         if (started) pump();
         int status[2] = {-1, -1};
         finish(status);
@@ -115,6 +116,7 @@ private:
                                          "--mic", mMic, "--speaker", mSpeaker};
         if (mOpt.noAck) args.push_back("--no-ack");
         args.push_back("--decoder=" + mOpt.decoder);
+        args.push_back("--start-on-stdin");
         if (!levelArgument().empty()) args.push_back(levelArgument());
         for (int i = 0; i < mCommon.verbose; ++i) args.push_back("-v");
         if (!mCommon.plugin.empty()) args.push_back("--plugin=" + mCommon.plugin);
@@ -133,6 +135,7 @@ private:
         std::string error;
         ChildProcess::Options options;
         options.ownGroup = true;  // Ctrl-C reaches the demo, which stops its devices
+        options.stdinPipe = true;  // the start line
         if (!mChild[who].start(selfExecutable(), args, env, options, &error)) {
             errf("cannot start the %s: %s", kWhoName[who], error.c_str());
             return false;
@@ -186,15 +189,28 @@ private:
                 if (!child.pump(0)) mOpen[who[i]] = false;
                 for (const std::string& line : child.takeLines()) onLine(static_cast<Who>(who[i]), line);
             }
-            // The speaker starts once the listener is ready; a listener that ended
-            // without getting ready ends the demo.
-            if (!mOpen[kListener] && !mReady[kListener]) break;
+            // A device that ended without getting ready ends the demo.
+            for (int w = 0; w < 2; ++w) {
+                if (!mOpen[w] && !mReady[w] && !mBegun) stopDevices();
+            }
+            if (mAborted) break;
+        }
+    }
+
+    void begin() {
+        mBegun = true;
+        for (int w = 0; w < 2; ++w) {
+            mChild[w].writeLine("go");
+            mQuietUntil[w] = monotonicMs() + silenceAllowedMs();
         }
     }
 
     // A stopped (or frozen) process does not act on SIGTERM: the demo kills its devices.
     void stopDevices() {
-        for (ChildProcess& c : mChild) c.sendSignal(interrupted() ? SIGTERM : SIGKILL);
+        for (int w = 0; w < 2; ++w) {
+            if (mChild[w].running() && mOpen[w]) mKilled[w] = true;
+            mChild[w].sendSignal(interrupted() ? SIGTERM : SIGKILL);
+        }
         mAborted = true;
     }
 
@@ -208,8 +224,9 @@ private:
         Round& r = mRounds[round];
         if (p.event == "ready") {
             mReady[who] = true;
+            mQuietUntil[who] = monotonicMs() + kStartupMs;  // its peer may still be starting
             show(t, who, "ready");
-            if (who == kListener && !mAborted && !mChild[kSpeaker].running()) startDevice(kSpeaker);
+            if (mReady[kListener] && mReady[kSpeaker] && !mAborted) begin();
         } else if (p.event == "said") {
             (who == kSpeaker ? r.said : r.answered) = code;
             (who == kSpeaker ? r.saidAt : r.answeredAt) = t;
@@ -308,7 +325,7 @@ private:
         if (!mStuck.empty()) return 1;  // its line is out
         std::string failed;
         for (int w = 0; w < 2; ++w) {
-            if (status[w] <= 0) continue;  // 0: finished well; -1: never started
+            if (status[w] <= 0 || mKilled[w]) continue;  // 0: finished well; -1: never started
             failed += std::string(failed.empty() ? "" : ", ") + "the " + kWhoName[w] + " ended with status " +
                       std::to_string(status[w]);
         }
@@ -336,6 +353,8 @@ private:
     int64_t mQuietUntil[2] = {0, 0};  // a device silent past this has stopped responding
     std::string mStuck;               // the device that stopped responding
     bool mAborted = false;
+    bool mBegun = false;
+    bool mKilled[2] = {false, false};  // stopped by the demo, its status not its own  // both were ready and told to begin
     std::map<int, Round> mRounds;
     std::map<int, bool> mCounted;
     std::vector<long long> mLatencies;  // per completed exchange, from the speaker's code

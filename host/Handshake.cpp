@@ -13,6 +13,9 @@
 // The plug-in's state machine only guards saying here: every code is said with
 // SayFreqIdx after the saying gate has been opened with setSpeakerState(0). A speaker
 // has role 2; a listener that answers has roles 1 and 2 (3), one that only hears role 1.
+#include <poll.h>
+#include <unistd.h>
+
 #include <CLI/CLI.hpp>
 
 #include "host/Clock.h"
@@ -42,6 +45,7 @@ struct HandshakeOptions {
     int firstCode = 0;
     LevelChoice level;
     std::string decoder = "host";
+    bool startOnStdin = false;
 };
 
 // Code the speaker says in round r (from 0). With acknowledgement the answer k + 1
@@ -50,6 +54,24 @@ struct HandshakeOptions {
 int speakerCode(const HandshakeOptions& o, int round) {
     if (o.noAck) return (o.firstCode + round) % kHandshakeCodes;
     return (o.firstCode + 2 * round) % (kHandshakeCodes - 1);
+}
+
+// After "ready", waits for a line on stdin before the first round, hearing meanwhile so the
+// microphone stays drained: the demo starts both devices together and lets them begin once
+// both have calibrated, so that neither's first wait counts the other's start-up.
+Outcome waitForStart(Hearing* hearing, Device& device) {
+    for (;;) {
+        const Outcome stop = device.interruption();
+        if (stop != Outcome::Done) return stop;
+        if (hearing) hearing->step();
+        pollfd in = {STDIN_FILENO, POLLIN, 0};
+        if (poll(&in, 1, hearing ? 0 : 20) <= 0) continue;
+        char text[64];
+        const ssize_t n = read(STDIN_FILENO, text, sizeof text);
+        if (n > 0) return Outcome::Done;
+        errf("standard input closed before the start");
+        return Outcome::TimedOut;
+    }
 }
 
 class Exchange {
@@ -197,6 +219,13 @@ int runHandshake(const CommonOptions& common, const HandshakeOptions& o) {
     progressf(JsonEvent("ready").add("role", o.role).add("ack", !o.noAck).add("rounds", o.rounds).add("t", t),
               "ready role=%s ack=%d rounds=%d t=%lld\n", o.role.c_str(), o.noAck ? 0 : 1, o.rounds, t);
 
+    if (o.startOnStdin) {
+        const Outcome start = waitForStart(settings.routes.mic ? &hearing : nullptr, session.device());
+        if (start != Outcome::Done) {
+            session.close();
+            return exitStatusOf(start);
+        }
+    }
     Exchange exchange(session, hearing, o);
     Outcome stop = Outcome::Done;
     const int completed = exchange.run(speaker, &stop);
@@ -242,6 +271,8 @@ Command addHandshakeCommand(CLI::App& app, CommonOptions& common) {
     addLevelOption(sub, &options->level,
                    "detection level: spectrum levels at or below it count as silence (raise it in noise)");
     addDecoderOption(sub, &options->decoder);
+    // The demo's own: not in the help.
+    sub->add_flag("--start-on-stdin", options->startOnStdin, "after ready, begin on a line from standard input")->group("");
     addRouteOptions(sub, common);
     return {sub, [&common, options] { return runHandshake(common, *options); }};
 }

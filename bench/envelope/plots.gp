@@ -14,7 +14,7 @@ do for [g in 'white-300ms white-40ms speech-300ms'] {
     set xlabel 'SNR (dB, tone over full-band noise)'
     set ylabel 'probability heard'
     set yrange [0:1.02]
-    set xrange [-20:30]
+    if (g eq 'speech-300ms') { set xrange [-45:30] } else { set xrange [-20:30] }
     unset key
     set title "host's decision (codes 0..22)"
     plot for [c=0:22] dir.'/heard-'.g.'.csv' using 6:(host(0) && $4==c ? $9 : 1/0) with linespoints pt 7 ps 0.4 lc c, \
@@ -33,7 +33,7 @@ set title 'Lowest SNR at which each code is heard in 99 % of 300 ms tones (lower
 set xlabel 'code'
 set ylabel 'SNR (dB)'
 set xrange [-0.5:22.5]
-set yrange [-22:32]
+set yrange [-47:32]
 set key outside right top
 plot dir.'/summary.csv' using 2:(host(0) ? $4 : 1/0) with linespoints pt 7 lc 'dark-blue' title "host, white noise", \
      dir.'/summary.csv' using 2:(host(0) ? $6 : 1/0) with linespoints pt 5 lc 'dark-cyan' title "host, speech-like", \
