@@ -1,0 +1,233 @@
+// The host's hearing: its decision on read-outs written by the test, the builtin
+// decision's guard, the calibration's proposals and the simulated capture and analysis.
+#include <array>
+#include <cmath>
+#include <set>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "host/hearing/BuiltinDecision.h"
+#include "host/hearing/Calibration.h"
+#include "host/hearing/CodeEvents.h"
+#include "host/hearing/HostDecision.h"
+#include "host/hearing/SimulatedEar.h"
+
+namespace {
+
+using namespace korvo::host;
+using Levels = std::array<float, korvo::kSpectrumBins>;
+
+// Every bin at `base`, code c's own bin `over` levels above it.
+Levels flat(float base, int code = -1, float over = 0.0f) {
+    Levels l{};
+    for (int b = 1; b < korvo::kSpectrumBins; ++b) l[b] = base;
+    if (code >= 0) l[korvo::codeIndex(code)] = base + over;
+    return l;
+}
+
+// The frame (from 1) on which the code is first heard among `frames` copies; 0 if never.
+int framesToHear(int code, float over, int frames = 8) {
+    HostDecision d;
+    const Levels l = flat(50.0f, code, over);
+    for (int n = 1; n <= frames; ++n) {
+        const CodeSet heard = d.addFrame(l.data(), 0);
+        EXPECT_EQ(heard & ~codeBit(code), 0u) << "another code heard";
+        if (heard & codeBit(code)) return n;
+    }
+    return 0;
+}
+
+TEST(HostDecision, OneLoudFrameOrSeveralFaintOnesAsTheThresholdsSay) {
+    // A level step is 1.2 dB of power: a bin x levels over the reference has ln u = 0.2763 x.
+    // One frame needs 4.018 nats (x >= 14.6); two 5.890, three 7.376, four 8.626, six 10.680,
+    // eight 12.390 (x >= 5.61 each).
+    EXPECT_EQ(framesToHear(5, 15.0f), 1);
+    EXPECT_EQ(framesToHear(5, 14.0f), 2);   // 2 x 3.868
+    EXPECT_EQ(framesToHear(5, 10.0f), 3);   // 2 x 2.763 < 5.890 <= 3 x 2.763
+    EXPECT_EQ(framesToHear(5, 7.0f), 6);    // 4 x 1.934 < 8.626; 6 x 1.934 >= 10.680
+    EXPECT_EQ(framesToHear(5, 5.5f), 0);    // 8 x 1.520 < 12.390
+    // The read-out's last codes and its first, with reference bins on one side near the top.
+    EXPECT_EQ(framesToHear(0, 15.0f), 1);
+    EXPECT_EQ(framesToHear(22, 15.0f), 1);
+
+    // A bin that is not a peak of its neighbourhood is not a code: a stronger bin two away,
+    // or a tone halfway between two codes' bins.
+    HostDecision d;
+    Levels beside = flat(50.0f, 9, 30.0f);
+    beside[korvo::codeIndex(9) + 2] = 81.0f;
+    Levels between = flat(50.0f);
+    between[35] = 90.0f;
+    for (int n = 0; n < 8; ++n) {
+        EXPECT_EQ(d.addFrame(beside.data(), 0), 0u);
+        EXPECT_EQ(d.addFrame(between.data(), 0), 0u);
+    }
+}
+
+TEST(HostDecision, HoldsWhileTheToneStaysAndLetsGoAfterThreeFrames) {
+    HostDecision d;
+    const Levels loud = flat(50.0f, 12, 20.0f);
+    const Levels holding = flat(50.0f, 12, 6.0f);  // 7.2 dB over the reference, the hold being 6
+    const Levels gone = flat(50.0f);
+    EXPECT_EQ(d.addFrame(loud.data(), 0), codeBit(12));
+    for (int n = 0; n < 10; ++n) EXPECT_EQ(d.addFrame(holding.data(), 0), codeBit(12)) << n;
+    EXPECT_EQ(d.addFrame(gone.data(), 0), codeBit(12));
+    EXPECT_EQ(d.addFrame(gone.data(), 0), codeBit(12));
+    EXPECT_EQ(d.addFrame(gone.data(), 0), 0u);
+    // Released, the faint tone is heard anew once eight frames of it add up (8 x 1.658 nats).
+    for (int n = 0; n < 7; ++n) EXPECT_EQ(d.addFrame(holding.data(), 0), 0u) << n;
+    EXPECT_EQ(d.addFrame(holding.data(), 0), codeBit(12));
+
+    // Entries at or below the detection level read 0 and count as the level itself.
+    HostDecision quiet;
+    Levels zeros{};
+    EXPECT_EQ(quiet.addFrame(zeros.data(), 60), 0u);
+    zeros[korvo::codeIndex(3)] = 75.0f;
+    EXPECT_EQ(quiet.addFrame(zeros.data(), 60), codeBit(3));
+}
+
+class FakeEar : public Ear {
+public:
+    Levels levels{};
+    Levels masked{};
+    int first = -1;
+    int second = -1;
+    int level = 0;
+    int spectrum(float* out) override {
+        std::copy(levels.begin(), levels.end(), out);
+        return 1;
+    }
+    int maskedSpectrum(float* out) override {
+        std::copy(masked.begin(), masked.end(), out);
+        return 1;
+    }
+    void twoPeaks(float*, int* a, int* b) override {
+        *a = first;
+        *b = second;
+    }
+    int detectionLevel() override { return level; }
+    void setDetectionLevel(int l) override { level = l; }
+};
+
+TEST(HostDecision, ARepeatedReadOutIsNoNewFrameAndALongStillnessLetsGo) {
+    FakeEar ear;
+    HostDecision d;
+    ear.levels = flat(50.0f, 4, 10.0f);  // three frames needed
+    for (int n = 0; n < 5; ++n) EXPECT_EQ(d.hear(ear), 0u);
+    ear.levels[1] = 51.0f;
+    EXPECT_EQ(d.hear(ear), 0u);
+    ear.levels[1] = 52.0f;
+    EXPECT_EQ(d.hear(ear), codeBit(4));
+    for (int n = 1; n < HostDecision::kStaleSteps; ++n) EXPECT_EQ(d.hear(ear), codeBit(4)) << n;
+    EXPECT_EQ(d.hear(ear), 0u);
+}
+
+TEST(BuiltinDecision, ThePeaksAreCodesUnlessAToneAboveTheBandsLeaksIntoThem) {
+    FakeEar ear;
+    BuiltinDecision d;
+    ear.first = korvo::codeIndex(17);
+    ear.second = korvo::codeIndex(4);
+    ear.masked[ear.first] = 60.0f;
+    ear.masked[ear.second] = 65.0f;
+    ear.levels = flat(30.0f);
+    EXPECT_EQ(d.hear(ear), codeBit(17) | codeBit(4));
+    ear.levels[210] = 71.0f;  // 11 levels over entry 200: not yet leakage
+    EXPECT_EQ(d.hear(ear), codeBit(17) | codeBit(4));
+    ear.levels[210] = 72.0f;  // code 18's tone: code 17 is its leakage; code 4 stands on its own
+    EXPECT_EQ(d.hear(ear), codeBit(4));
+    ear.first = 35;  // between codes
+    ear.second = -1;
+    EXPECT_EQ(d.hear(ear), 0u);
+    ear.masked = Levels{};
+    ear.first = korvo::codeIndex(3);
+    EXPECT_EQ(d.hear(ear), 0u);  // nothing analysed yet: an empty read-out
+}
+
+TEST(CodeEvents, AnOnsetAndAgainOnlyAfterAQuietGap) {
+    CodeEvents e;
+    EXPECT_EQ(e.update(0, codeBit(2)), codeBit(2));
+    EXPECT_EQ(e.update(1, codeBit(2) | codeBit(30)), codeBit(30));
+    EXPECT_EQ(e.update(11, codeBit(2)), 0u);   // 10 steps after step 1: the same tone
+    EXPECT_EQ(e.update(22, codeBit(2)), codeBit(2));
+}
+
+TEST(Calibration, ProposesTheLevelsTheNoiseModelGives) {
+    // Every bin at 40 in one analysed frame read over two steps. Each of the 18 codes'
+    // entries passes level L with probability exp(-10^(0.12 (L - 40))); per step that is
+    // 9 exp(-10^(0.12 d)) < 1e-4 when 10^(0.12 d) > ln 90000 = 11.41, d > 8.81: L = 49.
+    Calibration steady;
+    const Levels room = flat(40.0f);
+    steady.addStep(room.data());
+    steady.addStep(room.data());
+    EXPECT_EQ(steady.frames(), 1);
+    Calibration::Proposal p = steady.propose(DecoderKind::Builtin);
+    EXPECT_EQ(p.level, 49);
+    EXPECT_LT(p.falsePer10k, 1.0);
+    EXPECT_GT(steady.builtinFalsePerStep(48), 1e-4);
+    // The host's level: five levels under the quietest twentieth of the room's bins.
+    Levels uneven = flat(50.0f);
+    for (int b = 20; b < 40; ++b) uneven[b] = 30.0f;  // 20 of bins 20..255
+    Calibration host;
+    host.addStep(uneven.data());
+    EXPECT_EQ(host.propose(DecoderKind::Host).level, 25);
+
+    // A steady tone on a code's entry (masked entry 30 + 10c shows bin 29 + 10c) is no level's noise.
+    Levels tone = flat(40.0f);
+    tone[korvo::codeIndex(6) - 1] = 80.0f;
+    Calibration toned;
+    toned.addStep(tone.data());
+    EXPECT_GE(toned.propose(DecoderKind::Builtin).level, 80);
+
+    Calibration silent;
+    const Levels nothing{};
+    for (int n = 0; n < 5; ++n) silent.addStep(nothing.data());
+    p = silent.propose(DecoderKind::Builtin);
+    EXPECT_TRUE(p.silent);
+    EXPECT_EQ(p.level, 0);
+}
+
+// Frame f holds code (f % 18)'s tone: the read-out after a turn names the frame analysed.
+TEST(SimulatedEar, TurnsAnalyseTheRingAsItStoodAndRunsOfFiveFramesAtEachPhase) {
+    constexpr int kSteps = 200;
+    std::set<int> everAnalysed;
+    std::set<std::vector<int>> patterns;
+    for (int phase = 0; phase < kPhases; ++phase) {
+        SimulatedEar ear(phase);
+        std::vector<int16_t> frame(korvo::kFrameSamples);
+        std::set<int64_t> analysed;
+        for (int64_t f = 0; f < kSteps; ++f) {
+            const double hz = korvo::codeHz(static_cast<int>(f % 18));
+            for (int i = 0; i < korvo::kFrameSamples; ++i) {
+                frame[size_t(i)] = int16_t(std::lrint(9000.0 * std::sin(2.0 * M_PI * hz * double(f * korvo::kFrameSamples + i) / 44100.0)));
+            }
+            const int64_t before = ear.analysedFrame();
+            ear.step(frame.data());
+            const int64_t a = ear.analysedFrame();
+            if (a < 0 || a == before) continue;
+            ASSERT_LT(a, f) << "a turn sees the ring as it stood before this step's frame";
+            EXPECT_GE(a, f - korvo::kRingSlots);
+            float levels[korvo::kSpectrumBins] = {};
+            ear.spectrum(levels);
+            const int strongest = int(std::max_element(levels + 1, levels + korvo::kSpectrumBins) - levels);
+            EXPECT_EQ(strongest, korvo::codeIndex(static_cast<int>(a % 18))) << "phase " << phase << ", frame " << a;
+            if (f >= 20) analysed.insert(a);
+        }
+        // Five successive frames analysed, five skipped, over and over.
+        std::vector<int> residues;
+        for (int64_t a : analysed) {
+            EXPECT_TRUE(analysed.count(a + 10) || a + 10 >= kSteps - 12) << "phase " << phase << ", frame " << a;
+            residues.push_back(int(a % 10));
+        }
+        std::set<int> distinct(residues.begin(), residues.end());
+        ASSERT_EQ(distinct.size(), 5u) << "phase " << phase;
+        const int first = *std::find_if(distinct.begin(), distinct.end(), [&](int r) { return !distinct.count((r + 9) % 10); });
+        for (int k = 0; k < 5; ++k) EXPECT_TRUE(distinct.count((first + k) % 10)) << "phase " << phase;
+        everAnalysed.insert(distinct.begin(), distinct.end());
+        patterns.insert(std::vector<int>(distinct.begin(), distinct.end()));
+    }
+    // Some phase analyses any given frame.
+    EXPECT_EQ(everAnalysed.size(), 10u);
+    EXPECT_GE(patterns.size(), 5u);
+}
+
+}  // namespace
