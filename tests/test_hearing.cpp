@@ -135,6 +135,9 @@ TEST(BuiltinDecision, ThePeaksAreCodesUnlessAToneAboveTheBandsLeaksIntoThem) {
     EXPECT_EQ(d.hear(ear), codeBit(17) | codeBit(4));
     ear.levels[210] = 72.0f;  // code 18's tone: code 17 is its leakage; code 4 stands on its own
     EXPECT_EQ(d.hear(ear), codeBit(4));
+    ear.levels[210] = 30.0f;
+    ear.levels[korvo::codeIndex(17) + 3] = 30.5f;  // rising towards a tone above the bands
+    EXPECT_EQ(d.hear(ear), codeBit(4));
     ear.first = 35;  // between codes
     ear.second = -1;
     EXPECT_EQ(d.hear(ear), 0u);

@@ -10,6 +10,14 @@ bool BuiltinDecision::leakFromAbove(const float* levels, float level) {
     return false;
 }
 
+bool BuiltinDecision::risesAboveTheBands(const float* levels) {
+    const int own = korvo::codeIndex(kBuiltinCodes - 1);
+    for (int d = 1; d <= kEdgeBins; ++d) {
+        if (levels[own + d] > levels[own]) return true;
+    }
+    return false;
+}
+
 CodeSet BuiltinDecision::hear(Ear& ear) {
     float masked[korvo::kSpectrumBins] = {};
     if (ear.maskedSpectrum(masked) == 0) return 0;  // nothing analysed yet
@@ -26,7 +34,9 @@ CodeSet BuiltinDecision::hear(Ear& ear) {
             ear.spectrum(levels);
             unmaskedRead = true;
         }
-        if (!leakFromAbove(levels, masked[index])) heard |= codeBit(code);
+        if (leakFromAbove(levels, masked[index])) continue;
+        if (code == kBuiltinCodes - 1 && risesAboveTheBands(levels)) continue;
+        heard |= codeBit(code);
     }
     return heard;
 }

@@ -1,0 +1,237 @@
+// How the soundmeter command hears: scan against a live listen on the same recordings,
+// the host's decision on sox-made recordings, and a calibrated level in a noisy room.
+#include <cmath>
+#include <cstdlib>
+#include <filesystem>
+#include <regex>
+
+#include <gtest/gtest.h>
+#include <nlohmann/json.hpp>
+
+#include "support/HostProcess.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+using namespace korvo::testing;
+using Args = std::vector<std::string>;
+
+const std::string kHost = KORVO_HOST_PATH;
+constexpr int kRunMs = 90000;  // bounds only: a loaded machine may be slow
+constexpr double kFrameSeconds = 512.0 / 44100.0;
+constexpr double kToneAmplitude = 0.25;
+
+struct Tone {
+    int code;
+    int ms;
+};
+struct Heard {
+    int code;
+    double seconds;
+};
+
+std::string num(double v) {
+    char text[32];
+    snprintf(text, sizeof text, "%.4f", v);
+    return text;
+}
+
+// The codes a soundmeter command reported (--json), in order.
+std::vector<Heard> heardIn(const ProcessResult& r) {
+    std::vector<Heard> heard;
+    for (const std::string& line : linesOf(r.out)) {
+        const auto e = nlohmann::json::parse(line, nullptr, false);
+        if (e.is_object() && e["event"] == "heard") heard.push_back({e["code"].get<int>(), e["t_s"].get<double>()});
+    }
+    return heard;
+}
+
+std::string codesOf(const std::vector<Heard>& heard) {
+    std::string s;
+    for (const Heard& h : heard) s += std::to_string(h.code) + "@" + num(h.seconds) + " ";
+    return s;
+}
+
+class HostHearing : public ::testing::Test {
+protected:
+    void SetUp() override { ASSERT_NE(mkdtemp(&mDir[0]), nullptr); }
+    void TearDown() override { fs::remove_all(mDir); }
+    std::string path(const std::string& name) const { return mDir + "/" + name; }
+
+    void sox(const Args& args) {
+        const ProcessResult r = runHost("/usr/bin/sox", args, kRunMs);
+        ASSERT_EQ(r.status, 0) << r.err;
+    }
+
+    // sox's synth is band-limited at the file's rate: at 44.1 kHz a 21500 Hz tone (code 22)
+    // comes out 25 dB down. Made at 96 kHz and converted with a wide passband, it keeps its level.
+    static Args synthAt44k(const std::string& file) {
+        return {"-R", "-r", "96000", "-n", "-r", "44100", "-b", "16", "-c", "1", file};
+    }
+    const Args mToRate = {"rate", "-v", "-b", "99.7", "44100"};
+
+    // A recording made by sox: `leadMs` of quiet, then each tone (amplitude 0.25) after
+    // 300 ms of quiet, then 300 ms more; with noise (sox's whitenoise, or "speech": pink
+    // noise swelling at 4 Hz) whose RMS is `snrDb` under the tone's. Tone starts in *starts.
+    std::string record(const std::string& name, const std::vector<Tone>& tones, double snrDb = NAN, int leadMs = 300,
+                       const std::string& noise = "whitenoise", std::vector<double>* starts = nullptr) {
+        const std::string tonesFile = path(name + ".tones.wav");
+        Args a = synthAt44k(tonesFile);
+        double at = leadMs / 1000.0;
+        for (size_t i = 0; i < tones.size(); ++i) {
+            if (i > 0) a.push_back(":");
+            const double before = i == 0 ? leadMs / 1000.0 : 0.3;
+            at += i == 0 ? 0.0 : 0.3;
+            if (starts) starts->push_back(at);
+            at += tones[i].ms / 1000.0;
+            a.insert(a.end(), {"synth", num(tones[i].ms / 1000.0), "sine", std::to_string(86 * (30 + 10 * tones[i].code)),
+                               "vol", num(kToneAmplitude), "pad", num(before), i + 1 == tones.size() ? "0.3" : "0"});
+            a.insert(a.end(), mToRate.begin(), mToRate.end());
+        }
+        sox(a);
+        if (std::isnan(snrDb)) return tonesFile;
+        return withNoise(name, tonesFile, at + 0.3, kToneAmplitude / std::sqrt(2.0) / std::pow(10.0, snrDb / 20.0), noise);
+    }
+
+    // `seconds` of noise at an RMS of `rms` (of full scale), mixed under `tonesFile` when given.
+    std::string withNoise(const std::string& name, const std::string& tonesFile, double seconds, double rms,
+                          const std::string& noise = "whitenoise") {
+        const std::string raw = path(name + ".noise.wav");
+        Args a = synthAt44k(raw);
+        a.insert(a.end(), {"synth", num(seconds)});
+        a.push_back(noise == "speech" ? "pinknoise" : noise);
+        a.insert(a.end(), {"vol", "0.2"});
+        if (noise == "speech") a.insert(a.end(), {"tremolo", "4", "90"});
+        a.insert(a.end(), mToRate.begin(), mToRate.end());
+        sox(a);
+        const ProcessResult stat = runHost("/usr/bin/sox", {raw, "-n", "stat"}, kRunMs);
+        std::smatch m;
+        EXPECT_TRUE(std::regex_search(stat.err, m, std::regex("RMS +amplitude: +([0-9.]+)"))) << stat.err;
+        const double gain = rms / std::stod(m[1]);
+        const std::string out = path(name + ".wav");
+        if (tonesFile.empty()) {
+            sox({"-R", "-v", num(gain), raw, out});
+        } else {
+            sox({"-R", "-m", "-v", "1", tonesFile, "-v", num(gain), raw, out});
+        }
+        return out;
+    }
+
+    std::vector<Heard> scan(const std::string& file, Args extra = {}) {
+        Args args = {"--json", "scan", file};
+        args.insert(args.end(), extra.begin(), extra.end());
+        const ProcessResult r = runHost(kHost, args, kRunMs);
+        EXPECT_EQ(r.status, 0) << r.err;
+        return heardIn(r);
+    }
+
+    std::string mDir = "/tmp/korvo-hearing-XXXXXX";
+};
+
+TEST_F(HostHearing, ScanHearsWhatALiveListenHearsWithinAFrame) {
+    const std::string files[] = {
+        record("noisy", {{3, 300}, {9, 300}, {20, 300}}, 10.0),
+        record("short", {{12, 60}, {5, 80}, {17, 300}}),
+    };
+    for (const std::string& file : files) {
+        const std::vector<Heard> live = heardIn(runHost(kHost, {"--json", "listen", "--mic", "wav:" + file}, kRunMs));
+        ASSERT_FALSE(live.empty()) << file;
+        // Live, the analysis stands where the threads' start put it: some phase of the
+        // simulation is that one.
+        std::string tried;
+        bool agrees = false;
+        for (int phase = 0; phase < 10 && !agrees; ++phase) {
+            const std::vector<Heard> offline = scan(file, {"--phase", std::to_string(phase)});
+            tried += "\n  phase " + std::to_string(phase) + ": " + codesOf(offline);
+            agrees = offline.size() == live.size();
+            for (size_t i = 0; agrees && i < live.size(); ++i) {
+                agrees = offline[i].code == live[i].code && std::fabs(offline[i].seconds - live[i].seconds) <= kFrameSeconds + 1e-3;
+            }
+        }
+        EXPECT_TRUE(agrees) << file << "\nlive: " << codesOf(live) << tried;
+    }
+}
+
+TEST_F(HostHearing, EveryCodeInNoiseAsSaidAndNoCodeNobodySaid) {
+    // Codes 0..22 at 0 dB SNR in white noise, after 2 s of the noise for the calibration.
+    std::vector<Tone> all;
+    for (int c = 0; c <= 22; ++c) all.push_back({c, 300});
+    std::vector<double> starts;
+    const std::string noisy = record("all", all, 0.0, 2000, "whitenoise", &starts);
+    const std::vector<Heard> heard = scan(noisy, {"--level", "auto"});
+    ASSERT_EQ(heard.size(), all.size()) << codesOf(heard);
+    for (size_t i = 0; i < heard.size(); ++i) {
+        EXPECT_EQ(heard[i].code, int(i));
+        EXPECT_TRUE(heard[i].seconds > starts[i] && heard[i].seconds < starts[i] + 0.3 + 0.15) << codesOf(heard);
+    }
+
+    // Codes 18..23: the host hears 18..22 as themselves, HearFreqIdx's decision none of
+    // them (its read-out ends with code 17), and nobody hears 23, above half the rate.
+    // (At the plug-in's level 0, HearFreqIdx's decision hears the file's dither as codes:
+    // both calibrate on its first seconds.)
+    const std::string high = record("high", {{18, 300}, {19, 300}, {20, 300}, {21, 300}, {22, 300}, {23, 300}}, NAN, 2000);
+    for (const char* phase : {"0", "5"}) {
+        std::string codes;
+        for (const Heard& h : scan(high, {"--level", "auto", "--phase", phase})) codes += std::to_string(h.code) + " ";
+        EXPECT_EQ(codes, "18 19 20 21 22 ");
+        EXPECT_EQ(codesOf(scan(high, {"--decoder", "builtin", "--level", "auto", "--phase", phase})), "");
+    }
+
+    // Noise alone, steady and swelling like speech, at the calibrated levels: no code.
+    const std::string white = withNoise("white", "", 30.0, 0.03);
+    const std::string speech = withNoise("speech", "", 30.0, 0.1, "speech");
+    for (const std::string& file : {white, speech}) {
+        EXPECT_EQ(codesOf(scan(file, {"--level", "auto"})), "") << file;
+        EXPECT_EQ(codesOf(scan(file, {"--level", "auto", "--decoder", "builtin"})), "") << file;
+    }
+    // HearFreqIdx's decision at the plug-in's level hears the noise as codes.
+    EXPECT_GT(scan(white, {"--decoder", "builtin", "--level", "0"}).size(), 10u);
+}
+
+TEST_F(HostHearing, AFortyMillisecondToneIsHeardWhereAnAnalysedFrameHoldsIt) {
+    std::vector<double> starts;
+    const std::string file = record("short", {{8, 40}}, 20.0, 300, "whitenoise", &starts);
+    int phasesHeard = 0;
+    for (int phase = 0; phase < 10; ++phase) {
+        for (const Heard& h : scan(file, {"--phase", std::to_string(phase)})) {
+            EXPECT_EQ(h.code, 8) << "phase " << phase;
+            EXPECT_TRUE(h.seconds > starts[0] && h.seconds < starts[0] + 0.04 + 0.12) << h.seconds;
+            ++phasesHeard;
+        }
+    }
+    // Half the frames are never analysed: at some phases no analysed frame holds the tone.
+    EXPECT_GE(phasesHeard, 5);
+}
+
+TEST(HostCalibration, TheProposedLevelKeepsANoisyRoomQuietAndTonesHeard) {
+    const std::string room = uniqueRoom("calibrate");
+    const EnvList noise = {{"KORVO_SIM_NOISE", "-30"}, {"KORVO_SIM_SEED", "7"}};
+    auto in = [&room](Args args) {
+        args.insert(args.end(), {"--mic", "sim:" + room, "--speaker", "sim:" + room});
+        return args;
+    };
+    ProcessResult r = runHost(kHost, in({"--json", "calibrate", "--decoder", "builtin", "--seconds", "1.5"}), kRunMs, noise);
+    ASSERT_EQ(r.status, 0) << r.err;
+    const auto proposal = nlohmann::json::parse(r.out);
+    const int level = proposal["level"].get<int>();
+    EXPECT_GT(level, 0) << r.out;
+    EXPECT_LT(proposal["builtin_false_per_10k"].get<double>(), 1.0);
+
+    // The plug-in's own level lets the noise through as codes; the proposed one does not.
+    r = runHost(kHost, in({"--json", "listen", "--decoder", "builtin", "--level", "0", "--seconds", "2"}), kRunMs, noise);
+    EXPECT_FALSE(heardIn(r).empty()) << r.out;
+    r = runHost(kHost, in({"--json", "listen", "--decoder", "builtin", "--level", std::to_string(level), "--seconds", "4"}),
+                kRunMs, noise);
+    EXPECT_EQ(r.status, 0) << r.err;
+    EXPECT_EQ(codesOf(heardIn(r)), "");
+
+    HostProcess listener(kHost);
+    ASSERT_TRUE(listener.start(in({"listen", "--decoder", "builtin", "--level", std::to_string(level), "--code", "9", "--seconds", "60"}), noise));
+    ASSERT_TRUE(listener.waitForOutput("listening for code 9", 30000));
+    EXPECT_EQ(runHost(kHost, in({"say", "9", "--ms", "400"}), kRunMs, noise).status, 0);
+    r = listener.finish(kRunMs);
+    EXPECT_EQ(r.status, 0) << r.out << r.err;
+    EXPECT_FALSE(roomExists(room));
+}
+
+}  // namespace
