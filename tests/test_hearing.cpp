@@ -51,6 +51,26 @@ TEST(HostDecision, OneLoudFrameOrSeveralFaintOnesAsTheThresholdsSay) {
     EXPECT_EQ(framesToHear(0, 15.0f), 1);
     EXPECT_EQ(framesToHear(22, 15.0f), 1);
 
+    // A frame in which the bin dips under the noise (the noise cancelling the tone for a
+    // moment) is no evidence against it: +8 levels four times is heard (4 x 2.21 >= 8.626),
+    // and with a dip among them once six frames add up (5 x 2.21 >= 10.680).
+    {
+        HostDecision dips;
+        const Levels tone = flat(50.0f, 7, 8.0f);
+        const Levels dip = flat(50.0f, 7, -20.0f);
+        const Levels* frames[] = {&tone, &tone, &dip, &tone, &tone, &tone};
+        std::vector<CodeSet> heard;
+        for (const Levels* f : frames) heard.push_back(dips.addFrame(f->data(), 0));
+        EXPECT_EQ(heard, (std::vector<CodeSet>{0, 0, 0, 0, 0, codeBit(7)}));
+    }
+    // Code 22's reference reaches the read-out's last bin: a loud one there hides a faint tone.
+    {
+        HostDecision top;
+        Levels l = flat(50.0f, 22, 15.0f);
+        l[korvo::kSpectrumBins - 1] = 80.0f;
+        EXPECT_EQ(top.addFrame(l.data(), 0), 0u);
+    }
+
     // A bin that is not a peak of its neighbourhood is not a code: a stronger bin two away,
     // or a tone halfway between two codes' bins.
     HostDecision d;
