@@ -1,6 +1,6 @@
 #!/usr/bin/env bash
 # Measures the operating envelope of the link and writes its CSV files and plots into
-# docs/envelope (about half an hour on two cores). Arguments go to korvo_envelope
+# docs/envelope (about 20 minutes on two cores). Arguments go to korvo_envelope
 # (--trials N, --quick, --no-realtime).
 set -euo pipefail
 cd "$(dirname "$0")/.."

@@ -1,7 +1,7 @@
 // korvo_envelope: the operating envelope of the link, measured on the offline listener
 // (the library's analysis and detection with a live listener's timing) and checked
 // against real-time runs of `soundmeter listen` at a few points. Run by hand
-// (scripts/envelope.sh; about half an hour on two cores): it writes CSV files and
+// (scripts/envelope.sh; about 20 minutes on two cores): it writes CSV files and
 // gnuplot's PNG plots into the output folder.
 //
 //   korvo_envelope [--out DIR] [--trials N] [--quick] [--no-realtime] [--soundmeter PATH]
