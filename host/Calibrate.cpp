@@ -17,12 +17,11 @@ namespace {
 
 struct CalibrateOptions {
     double seconds = 2.0;
-    std::string decoder = "host";
+    DecoderKind decoder = DecoderKind::Host;
 };
 
 int runCalibrate(const CommonOptions& common, const CalibrateOptions& o) {
-    DecoderKind kind = DecoderKind::Host;
-    parseDecoder(o.decoder, &kind);
+    const DecoderKind kind = o.decoder;
     Session session(common);
     DeviceSettings settings;
     settings.role = 1;

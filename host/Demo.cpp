@@ -38,7 +38,7 @@ struct DemoOptions {
     int toneMs = 300;
     int timeoutMs = 8000;
     LevelChoice level;
-    std::string decoder = "host";
+    DecoderKind decoder = DecoderKind::Host;
 };
 
 // In noise the room carries the speakers to the microphones 20 dB down, so that the
@@ -97,7 +97,7 @@ public:
         const std::string where = freshRoom ? "in room " + mRoom : "on mic " + mMic + ", speaker " + mSpeaker;
         infof("demo %s: %s, acknowledgement %s, tones of %d ms, %s, %s decision%s\n", where.c_str(),
               plural(mOpt.rounds, "round").c_str(), mOpt.noAck ? "off" : "on", mOpt.toneMs, noise.c_str(),
-              mOpt.decoder.c_str(), levelArgument().empty() ? "" : (", " + levelArgument().substr(2)).c_str());
+              decoderName(mOpt.decoder), levelArgument().empty() ? "" : (", " + levelArgument().substr(2)).c_str());
 
         // Both start together and calibrate at once; they begin when both are ready.
         const bool started = startDevice(kListener) && startDevice(kSpeaker);
@@ -115,7 +115,7 @@ private:
                                          std::to_string(mOpt.toneMs), "--timeout-ms", std::to_string(mOpt.timeoutMs),
                                          "--mic", mMic, "--speaker", mSpeaker};
         if (mOpt.noAck) args.push_back("--no-ack");
-        args.push_back("--decoder=" + mOpt.decoder);
+        args.push_back(std::string("--decoder=") + decoderName(mOpt.decoder));
         args.push_back("--start-on-stdin");
         if (!levelArgument().empty()) args.push_back(levelArgument());
         for (int i = 0; i < mCommon.verbose; ++i) args.push_back("-v");

@@ -44,7 +44,7 @@ struct HandshakeOptions {
     int timeoutMs = 10000;
     int firstCode = 0;
     LevelChoice level;
-    std::string decoder = "host";
+    DecoderKind decoder = DecoderKind::Host;
     bool startOnStdin = false;
 };
 
@@ -198,8 +198,7 @@ int runHandshake(const CommonOptions& common, const HandshakeOptions& o) {
              o.noAck ? "without acknowledgement" : "with acknowledgement, whose answer is code + 1");
         return 2;
     }
-    DecoderKind kind = DecoderKind::Host;
-    parseDecoder(o.decoder, &kind);
+    const DecoderKind kind = o.decoder;
     Session session(common);
     DeviceSettings settings;
     settings.role = speaker ? 2 : (o.noAck ? 1 : 3);

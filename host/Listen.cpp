@@ -20,7 +20,7 @@ namespace {
 struct ListenOptions {
     int code = -1;  // -1: report every code
     LevelChoice level;
-    std::string decoder = "host";
+    DecoderKind decoder = DecoderKind::Host;
     double seconds = 10.0;  // 0: until Ctrl-C
 };
 
@@ -124,8 +124,7 @@ int reportCodes(Session& session, Hearing& hearing, const ListenOptions& o) {
 }
 
 int runListen(const CommonOptions& common, const ListenOptions& o) {
-    DecoderKind kind = DecoderKind::Host;
-    parseDecoder(o.decoder, &kind);
+    const DecoderKind kind = o.decoder;
     Session session(common);
     DeviceSettings settings;
     settings.role = 1;  // listener without acknowledgement: hearing changes nothing it needs

@@ -18,7 +18,7 @@ namespace {
 
 struct MonitorOptions {
     LevelChoice level;
-    std::string decoder = "host";
+    DecoderKind decoder = DecoderKind::Host;
     double seconds = 0.0;  // 0: until Ctrl-C
 };
 
@@ -74,8 +74,7 @@ void drawFrame(bool ansi, bool first, SoundMeter_vir& meter, const float* levels
 }
 
 int runMonitor(const CommonOptions& common, const MonitorOptions& o) {
-    DecoderKind kind = DecoderKind::Host;
-    parseDecoder(o.decoder, &kind);
+    const DecoderKind kind = o.decoder;
     Session session(common);
     DeviceSettings settings;
     settings.role = 1;

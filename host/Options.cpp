@@ -2,6 +2,7 @@
 
 #include <cmath>
 #include <cstdlib>
+#include <map>
 
 #include <CLI/CLI.hpp>
 
@@ -68,12 +69,14 @@ void addLevelOption(CLI::App* sub, LevelChoice* level, const char* help, bool al
             "", "level"));
 }
 
-void addDecoderOption(CLI::App* sub, std::string* decoder) {
+void addDecoderOption(CLI::App* sub, DecoderKind* decoder) {
+    static const std::map<std::string, DecoderKind> kKinds = {{"host", DecoderKind::Host},
+                                                             {"builtin", DecoderKind::Builtin}};
     sub->add_option("--decoder", *decoder,
                     "how codes are heard: host (each code's own bin, over one or more analysed frames) or builtin "
                     "(the plug-in's HearFreqIdx decision: one masked spectrum, codes 0..17)")
-        ->check(CLI::IsMember({"host", "builtin"}))
-        ->capture_default_str();
+        ->transform(CLI::CheckedTransformer(kKinds))
+        ->default_str(decoderName(*decoder));
 }
 
 void addRouteOptions(CLI::App* sub, CommonOptions& common, const char* micDefault, const char* speakerDefault) {

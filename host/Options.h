@@ -3,6 +3,8 @@
 #include <functional>
 #include <string>
 
+#include "host/hearing/Decoder.h"
+
 namespace CLI {
 class App;
 class Validator;
@@ -46,7 +48,7 @@ CLI::Validator finiteRange(double lo, double hi);
 // --level L (and "auto" where `allowAuto`).
 void addLevelOption(CLI::App* sub, LevelChoice* level, const char* help, bool allowAuto = true);
 // --decoder host|builtin.
-void addDecoderOption(CLI::App* sub, std::string* decoder);
+void addDecoderOption(CLI::App* sub, DecoderKind* decoder);
 // Adds --mic and --speaker, checked as ROUTE texts; the defaults are named in their help.
 void addRouteOptions(CLI::App* sub, CommonOptions& common, const char* micDefault = "KORVO_MIC, else null",
                      const char* speakerDefault = "KORVO_SPEAKER, else null");

@@ -29,15 +29,14 @@ constexpr int kFileTailSteps = 22;
 
 struct ScanOptions {
     std::string file;
-    std::string decoder = "host";
+    DecoderKind decoder = DecoderKind::Host;
     LevelChoice level;
     int phase = 0;
 };
 
 int runScan(const CommonOptions& common, const ScanOptions& o) {
     applyLogSettings(common.verbose);
-    DecoderKind kind = DecoderKind::Host;
-    parseDecoder(o.decoder, &kind);
+    const DecoderKind kind = o.decoder;
     std::string cause;
     std::unique_ptr<korvo::platform::Recording> recording =
         korvo::platform::Recording::open(o.file, korvo::kSampleRate, &cause);

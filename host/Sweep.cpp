@@ -33,7 +33,7 @@ struct SweepOptions {
     double seconds = 5.0;
     bool noAck = false;
     bool allCodes = false;
-    std::string decoder = "host";
+    DecoderKind decoder = DecoderKind::Host;
 };
 
 // Codes the host's own walk says: those every listener hears as themselves.
@@ -166,8 +166,7 @@ private:
 };
 
 int runSweep(const CommonOptions& common, const SweepOptions& o) {
-    DecoderKind kind = DecoderKind::Host;
-    parseDecoder(o.decoder, &kind);
+    const DecoderKind kind = o.decoder;
     SaidCodes codes;
     Session session(common);
     DeviceSettings settings;

@@ -16,9 +16,6 @@ namespace envelope {
 
 namespace {
 
-constexpr int kFrame = korvo::kFrameSamples;
-constexpr double kRate = korvo::kSampleRate;
-
 struct Layout {
     std::vector<int64_t> starts;  // of the tones, in samples
     int64_t toneSamples = 0;

@@ -7,7 +7,6 @@ namespace korvo {
 namespace envelope {
 
 namespace {
-constexpr double kRate = 44100.0;
 constexpr double kPi = 3.14159265358979323846;
 }  // namespace
 

@@ -8,8 +8,14 @@
 #include <random>
 #include <vector>
 
+#include "interface/SoundMeterConstants.h"
+
 namespace korvo {
 namespace envelope {
+
+// The microphone's rate and a capture step's frame.
+constexpr double kRate = korvo::kSampleRate;
+constexpr int kFrame = korvo::kFrameSamples;
 
 enum class Noise { White, Speech };
 const char* noiseName(Noise noise);

@@ -10,9 +10,6 @@ namespace envelope {
 
 namespace {
 
-constexpr int kFrame = korvo::kFrameSamples;
-constexpr double kRate = korvo::kSampleRate;
-
 struct Trial {
     bool heard = false;
     double latencyMs = 0.0;

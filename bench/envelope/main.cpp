@@ -65,6 +65,14 @@ void runAll(std::vector<std::function<void()>>& jobs, unsigned threads) {
     fprintf(stderr, "\n");
 }
 
+std::vector<PointResult> runPoints(const std::vector<Point>& points, const Settings& s) {
+    std::vector<PointResult> results(points.size());
+    std::vector<std::function<void()>> jobs;
+    for (size_t i = 0; i < points.size(); ++i) jobs.push_back([&, i] { results[i] = runPoint(points[i]); });
+    runAll(jobs, s.threads);
+    return results;
+}
+
 uint64_t seedOf(int grid, int decoder, int code, double x) {
     return 1000003ull * grid + 10007ull * decoder + 101ull * (code + 1) + static_cast<uint64_t>(std::lround(x * 10 + 1000));
 }
@@ -86,12 +94,8 @@ std::vector<PointResult> measure(int grid, Noise noise, double toneMs, const std
             }
         }
     }
-    std::vector<PointResult> results(points.size());
-    std::vector<std::function<void()>> jobs;
-    for (size_t i = 0; i < points.size(); ++i) jobs.push_back([&, i] { results[i] = runPoint(points[i]); });
     fprintf(stderr, "%s noise, tones of %.0f ms: %zu points of %d trials\n", noiseName(noise), toneMs, points.size(), s.trials);
-    runAll(jobs, s.threads);
-    return results;
+    return runPoints(points, s);
 }
 
 std::vector<PointResult> measureLengths(const Settings& s) {
@@ -110,12 +114,8 @@ std::vector<PointResult> measureLengths(const Settings& s) {
             }
         }
     }
-    std::vector<PointResult> results(points.size());
-    std::vector<std::function<void()>> jobs;
-    for (size_t i = 0; i < points.size(); ++i) jobs.push_back([&, i] { results[i] = runPoint(points[i]); });
     fprintf(stderr, "tone lengths at %.0f dB SNR: %zu points\n", kLengthSnr, points.size());
-    runAll(jobs, s.threads);
-    return results;
+    return runPoints(points, s);
 }
 
 std::vector<FalseResult> measureFalse(const Settings& s) {

@@ -1,5 +1,7 @@
 #include "host/hearing/BuiltinDecision.h"
 
+#include <initializer_list>
+
 namespace korvo {
 namespace host {
 

@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <cmath>
 
+#include "host/hearing/LevelPower.h"
+
 namespace korvo {
 namespace host {
 
@@ -11,8 +13,6 @@ namespace {
 constexpr int kLastBin = korvo::kLastSpectrumEntry;
 // The bins the decisions look at: from a little below code 0 to the read-out's end.
 constexpr int kFirstRoomBin = 20;
-
-double powerOf(double level) { return std::pow(10.0, 0.12 * level); }
 
 }  // namespace
 
@@ -25,14 +25,14 @@ void Calibration::addStep(const float* levels) {
 
 double Calibration::builtinFalsePerStep(int level) const {
     if (mFrames.empty() || mSteps == 0) return 0.0;
-    const double threshold = powerOf(level);
+    const double threshold = levelPower(level);
     double sum = 0.0;
     for (const auto& f : mFrames) {
         for (int c = 0; c < kBuiltinCodes; ++c) {
             const int bin = korvo::codeIndex(c) - 1;  // masked entry 30 + 10c carries bin 29 + 10c
             double mean = 0.0;
             for (int d = 1; d <= kLocalBins; ++d) {
-                mean += (f[bin - d] == 0.0f ? 0.0 : powerOf(f[bin - d])) + (f[bin + d] == 0.0f ? 0.0 : powerOf(f[bin + d]));
+                mean += (f[bin - d] == 0.0f ? 0.0 : levelPower(f[bin - d])) + (f[bin + d] == 0.0f ? 0.0 : levelPower(f[bin + d]));
             }
             mean /= 2 * kLocalBins;
             if (mean > 0.0) sum += std::exp(-threshold / mean);

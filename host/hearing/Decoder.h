@@ -4,7 +4,6 @@
 #pragma once
 #include <cstdint>
 #include <memory>
-#include <string>
 
 #include "host/hearing/Ear.h"
 #include "interface/SoundMeterConstants.h"
@@ -14,10 +13,8 @@ namespace host {
 
 enum class DecoderKind { Host, Builtin };
 
-// "host" or "builtin".
+// "host" or "builtin", as --decoder takes it.
 const char* decoderName(DecoderKind kind);
-// False for any other text.
-bool parseDecoder(const std::string& text, DecoderKind* kind);
 
 // Codes a decoder can report: their bins lie in the read-out it uses. The host's
 // decision reads every bin (codes 0..22, bins 30..250); HearFreqIdx reads the masked

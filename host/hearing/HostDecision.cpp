@@ -4,15 +4,14 @@
 #include <cmath>
 #include <cstdlib>
 
+#include "host/hearing/LevelPower.h"
+
 namespace korvo {
 namespace host {
 
 namespace {
 
 constexpr int kLastBin = korvo::kLastSpectrumEntry;
-
-// Power of a level, up to a constant factor: one level unit is 1.2 dB of magnitude.
-double powerOf(float level) { return std::pow(10.0, 0.12 * level); }
 
 double fromDb(double db) { return std::pow(10.0, db / 10.0); }
 
@@ -59,9 +58,9 @@ double HostDecision::evidence(const Track& t, int n, bool* peak) const {
 }
 
 CodeSet HostDecision::addFrame(const float* levels, int level) {
-    const double floor = powerOf(static_cast<float>(level));  // a 0 entry lies at or below the level
+    const double floor = levelPower(level);  // a 0 entry lies at or below the level
     std::array<double, korvo::kSpectrumBins> powers{};
-    for (int b = 1; b <= kLastBin; ++b) powers[static_cast<size_t>(b)] = levels[b] == 0.0f ? floor : powerOf(levels[b]);
+    for (int b = 1; b <= kLastBin; ++b) powers[static_cast<size_t>(b)] = levels[b] == 0.0f ? floor : levelPower(levels[b]);
     auto power = [&](int bin) { return bin < 1 || bin > kLastBin ? 0.0 : powers[static_cast<size_t>(bin)]; };
     const double hold = std::log(fromDb(kHoldDb));
     for (int c = 0; c < kHostCodes; ++c) {
