@@ -8,12 +8,17 @@
 namespace korvo {
 namespace host {
 
-Hearing::Hearing(Device& device, DecoderKind kind)
-    : mDevice(device), mKind(kind), mEar(device.meter()), mDecoder(makeDecoder(kind)) {}
+Hearing::Hearing(Device& device, DecoderKind kind, bool seeAll)
+    : mDevice(device),
+      mKind(kind),
+      mEar(device.meter()),
+      mLevelled(seeAll ? std::make_unique<LevelledEar>(mEar) : nullptr),
+      mDecisionEar(seeAll ? static_cast<Ear*>(mLevelled.get()) : &mEar),
+      mDecoder(makeDecoder(kind)) {}
 
 CodeSet Hearing::step() {
     mDevice.step();
-    mHeard = mDecoder->hear(mEar);
+    mHeard = mDecoder->hear(*mDecisionEar);
     return mEvents.update(mDevice.steps(), mHeard);
 }
 
@@ -49,7 +54,7 @@ Outcome Hearing::listenToRoom(int steps, Calibration* calibration) {
 }
 
 void Hearing::setLevel(int level) {
-    mDevice.meter().setDetectionLevel(level);
+    mDecisionEar->setDetectionLevel(level);
     mDecoder->reset();  // what it saw at another level says nothing at this one
 }
 

@@ -8,13 +8,16 @@
 #include "host/hearing/Calibration.h"
 #include "host/hearing/CodeEvents.h"
 #include "host/hearing/Decoder.h"
+#include "host/hearing/LevelledEar.h"
 
 namespace korvo {
 namespace host {
 
 class Hearing {
 public:
-    Hearing(Device& device, DecoderKind kind);
+    // With `seeAll`, the meter's read-out shows every bin (seenSpectrum) and the decoder
+    // sees it with the detection level applied by the host (LevelledEar).
+    Hearing(Device& device, DecoderKind kind, bool seeAll = false);
 
     // One capture step and the decision after it: the codes that begin to be heard.
     CodeSet step();
@@ -33,6 +36,10 @@ public:
     Outcome listenToRoom(int steps, Calibration* calibration);
     // Sets a detection level; the decoder starts afresh at it.
     void setLevel(int level);
+    // The detection level the decoder hears at.
+    int level() { return mDecisionEar->detectionLevel(); }
+    // The meter's read-out now (getSpectrumData), every bin when seeing all.
+    int seenSpectrum(float* out) { return mEar.spectrum(out); }
     // Applies --level: nothing, a number, or calibration first ("auto", said on stderr).
     Outcome applyLevel(const LevelChoice& level);
 
@@ -40,6 +47,8 @@ private:
     Device& mDevice;
     DecoderKind mKind;
     MeterEar mEar;
+    std::unique_ptr<LevelledEar> mLevelled;
+    Ear* mDecisionEar;
     std::unique_ptr<Decoder> mDecoder;
     CodeEvents mEvents;
     CodeSet mHeard = 0;

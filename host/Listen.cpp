@@ -3,10 +3,9 @@
 // a moment after the file does, and on a terminal it shows where it is in the file.
 #include <CLI/CLI.hpp>
 
-#include <korvo/platform/Routes.h>
-
 #include "host/Clock.h"
 #include "host/CodePlan.h"
+#include "host/FileWatch.h"
 #include "host/Hearing.h"
 #include "host/JsonEvent.h"
 #include "host/Options.h"
@@ -22,40 +21,6 @@ struct ListenOptions {
     LevelChoice level;
     DecoderKind decoder = DecoderKind::Host;
     double seconds = 10.0;  // 0: until Ctrl-C
-};
-
-// After a file's last sample, the capture ring and the analysis thread hold a few
-// more frames (5 frames of 11.6 ms, one analysed per 20 ms turn).
-constexpr int64_t kFileTailMs = 250;
-constexpr int64_t kProgressEveryMs = 200;
-
-// Where a file microphone stands: its end, and a progress line on a terminal.
-class FileWatch {
-public:
-    // True once the file has been delivered whole and its last frames analysed.
-    bool over(int64_t now) {
-        const korvo::platform::SourceProgress p = korvo::platform::microphoneStatus().progress;
-        if (!p.finite) return false;
-        if (p.ended && mEndedAt < 0) mEndedAt = now;
-        if (mTerminal && now >= mNextShow) {
-            mNextShow = now + kProgressEveryMs;
-            outf("\r  %.1f s of %.1f s in the file, %.1f s left\x1b[K", p.seconds, p.totalSeconds,
-                 p.totalSeconds > p.seconds ? p.totalSeconds - p.seconds : 0.0);
-            mShown = true;
-        }
-        return mEndedAt >= 0 && now >= mEndedAt + kFileTailMs;
-    }
-    // Clears the progress line before a result is printed.
-    void clear() {
-        if (mShown) outf("\r\x1b[K");
-        mShown = false;
-    }
-
-private:
-    bool mTerminal = hostOutputIsTerminal() && outputMode() == OutputMode::Normal;
-    int64_t mEndedAt = -1;
-    int64_t mNextShow = 0;
-    bool mShown = false;
 };
 
 int64_t deadlineOf(int64_t start, double seconds) {

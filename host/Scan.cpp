@@ -9,23 +9,17 @@
 #include <korvo/platform/Recording.h>
 
 #include <chrono>
-#include <vector>
 
 #include "host/CodePlan.h"
 #include "host/Environment.h"
-#include "host/Interrupt.h"
 #include "host/JsonEvent.h"
 #include "host/Options.h"
 #include "host/Output.h"
-#include "host/hearing/OfflineListener.h"
+#include "host/OfflineRun.h"
 
 namespace korvo {
 namespace host {
 namespace {
-
-// After the file's last sample, a live listener goes on for 250 ms: its ring and the
-// analysis hold a few more frames.
-constexpr int kFileTailSteps = 22;
 
 struct ScanOptions {
     std::string file;
@@ -46,30 +40,15 @@ int runScan(const CommonOptions& common, const ScanOptions& o) {
     }
     const auto began = std::chrono::steady_clock::now();
     OfflineListener listener(kind, o.phase);
+    bool reportedLevel = false;
     if (o.level.given && o.level.automatic) listener.calibrateFirst();
     if (o.level.given && !o.level.automatic) listener.setLevel(o.level.value);
 
-    std::vector<int16_t> frame(korvo::kFrameSamples);
     int count = 0;
-    int tail = 0;
-    bool ended = false;
-    double audioSeconds = 0.0;
-    while (tail < kFileTailSteps) {
-        if (interrupted()) return 130;
-        if (!ended) {
-            const long got = recording->read(frame.data(), korvo::kFrameSamples, &cause);
-            if (got < 0) {
-                errf("scan %s: %s", o.file.c_str(), cause.c_str());
-                return 1;
-            }
-            audioSeconds += static_cast<double>(got) / korvo::kSampleRate;
-            ended = got < korvo::kFrameSamples;
-            std::fill(frame.begin() + got, frame.end(), int16_t{0});
-        }
-        if (ended) ++tail;
-        const bool calibrating = o.level.automatic && !listener.calibrated();
-        const CodeSet begun = listener.step(frame.data());
-        if (calibrating && listener.calibrated()) {
+    OfflineRun run;
+    const bool read = hearRecording(*recording, listener, 0.0, [&](CodeSet begun) {
+        if (o.level.automatic && !reportedLevel && listener.calibrated()) {
+            reportedLevel = true;
             infof("detection level %d (calibrated on %.1f s of the recording for the %s decision)\n",
                   listener.proposal().level, stepSeconds(kAutoCalibrationSteps), decoderName(kind));
         }
@@ -78,7 +57,13 @@ int runScan(const CommonOptions& common, const ScanOptions& o) {
             ++count;
             printHeard(c, listener.seconds());
         }
+    }, &run, &cause);
+    if (!read) {
+        errf("scan %s: %s", o.file.c_str(), cause.c_str());
+        return 1;
     }
+    if (run.interrupted) return 130;
+    const double audioSeconds = run.audioSeconds;
     const double took = std::chrono::duration<double>(std::chrono::steady_clock::now() - began).count();
     resultf(JsonEvent("summary").add("audio_s", audioSeconds).add("took_s", took).add("codes", count),
             "scanned %.1f s of audio in %.2f s: %s\n", audioSeconds, took, plural(count, "code").c_str());

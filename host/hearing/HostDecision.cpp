@@ -17,18 +17,20 @@ double fromDb(double db) { return std::pow(10.0, db / 10.0); }
 
 }  // namespace
 
-HostDecision::HostDecision() {
-    // The twelve bins nearest to the code's bin from kNearestReference on, inside the
-    // read-out (near its top, code 22 takes more of them from below).
-    for (int c = 0; c < kHostCodes; ++c) {
-        const int bin = korvo::codeIndex(c);
-        int found = 0;
-        for (int d = kNearestReference; found < kReferenceBins; ++d) {
-            for (int b : {bin - d, bin + d}) {
-                if (b >= 1 && b <= kLastBin && found < kReferenceBins) mReference[c][found++] = b;
-            }
+std::array<int, HostDecision::kReferenceBins> HostDecision::referenceBins(int code) {
+    std::array<int, kReferenceBins> bins{};
+    const int bin = korvo::codeIndex(code);
+    int found = 0;
+    for (int d = kNearestReference; found < kReferenceBins; ++d) {
+        for (int b : {bin - d, bin + d}) {
+            if (b >= 1 && b <= kLastBin && found < kReferenceBins) bins[static_cast<size_t>(found++)] = b;
         }
     }
+    return bins;
+}
+
+HostDecision::HostDecision() {
+    for (int c = 0; c < kHostCodes; ++c) mReference[static_cast<size_t>(c)] = referenceBins(c);
 }
 
 void HostDecision::reset() {

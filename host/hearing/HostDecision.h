@@ -44,6 +44,9 @@ public:
 
     HostDecision();
     CodeSet hear(Ear& ear) override;
+    // The bins whose mean power is code `code`'s reference: the twelve nearest from
+    // kNearestReference bins away, inside the read-out (code 22 takes more from below).
+    static std::array<int, kReferenceBins> referenceBins(int code);
     void reset() override;
 
     // For one read-out taken as a new analysed frame (levels as getSpectrumData gives

@@ -3,8 +3,12 @@
 namespace korvo {
 namespace host {
 
-OfflineListener::OfflineListener(DecoderKind kind, int phase)
-    : mKind(kind), mEar(phase), mDecoder(makeDecoder(kind)) {}
+OfflineListener::OfflineListener(DecoderKind kind, int phase, bool seeAll)
+    : mKind(kind),
+      mEar(phase),
+      mLevelled(seeAll ? std::make_unique<LevelledEar>(mEar) : nullptr),
+      mDecisionEar(seeAll ? static_cast<Ear*>(mLevelled.get()) : &mEar),
+      mDecoder(makeDecoder(kind)) {}
 
 CodeSet OfflineListener::step(const int16_t* frame) {
     mEar.step(frame);
@@ -17,13 +21,13 @@ CodeSet OfflineListener::step(const int16_t* frame) {
         mCalibration.addStep(levels);
         if (n == kWarmUpSteps + kAutoCalibrationSteps) {
             mProposal = mCalibration.propose(mKind);
-            mEar.setDetectionLevel(mProposal.level);
+            mDecisionEar->setDetectionLevel(mProposal.level);
             mCalibrating = false;
             mCalibrated = true;
         }
         return 0;
     }
-    mHeard = mDecoder->hear(mEar);
+    mHeard = mDecoder->hear(*mDecisionEar);
     return mEvents.update(n, mHeard);
 }
 

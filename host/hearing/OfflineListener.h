@@ -7,6 +7,7 @@
 #include "host/hearing/Calibration.h"
 #include "host/hearing/CodeEvents.h"
 #include "host/hearing/Decoder.h"
+#include "host/hearing/LevelledEar.h"
 #include "host/hearing/SimulatedEar.h"
 #include "host/hearing/StepClock.h"
 
@@ -15,10 +16,12 @@ namespace host {
 
 class OfflineListener {
 public:
-    OfflineListener(DecoderKind kind, int phase);
+    // With `seeAll`, the read-out shows every bin (seenSpectrum) and the decoder sees
+    // it with the detection level applied by the host (LevelledEar).
+    OfflineListener(DecoderKind kind, int phase, bool seeAll = false);
 
     // A fixed detection level, or calibration on the room after the warm-up.
-    void setLevel(int level) { mEar.setDetectionLevel(level); }
+    void setLevel(int level) { mDecisionEar->setDetectionLevel(level); }
     void calibrateFirst() { mCalibrating = true; }
 
     // One capture step with the next frame of 512 samples: the codes that begin to be
@@ -30,7 +33,9 @@ public:
     int64_t steps() const { return mEar.steps(); }
     int64_t analysedFrame() const { return mEar.analysedFrame(); }
     double seconds() const { return stepSeconds(steps()); }
-    int level() { return mEar.detectionLevel(); }
+    int level() { return mDecisionEar->detectionLevel(); }
+    // The read-out after the last step (getSpectrumData), every bin when seeing all.
+    int seenSpectrum(float* out) { return mEar.spectrum(out); }
     // What the calibration proposed, once it has run.
     const Calibration::Proposal& proposal() const { return mProposal; }
     bool calibrated() const { return mCalibrated; }
@@ -38,6 +43,8 @@ public:
 private:
     DecoderKind mKind;
     SimulatedEar mEar;
+    std::unique_ptr<LevelledEar> mLevelled;
+    Ear* mDecisionEar;
     std::unique_ptr<Decoder> mDecoder;
     CodeEvents mEvents;
     CodeSet mHeard = 0;
