@@ -62,6 +62,7 @@ Command addMonitorCommand(CLI::App& app, CommonOptions& common);
 Command addDevicesCommand(CLI::App& app, CommonOptions& common);
 Command addScanCommand(CLI::App& app, CommonOptions& common);
 Command addCalibrateCommand(CLI::App& app, CommonOptions& common);
+Command addSpectrogramCommand(CLI::App& app, CommonOptions& common);
 
 }  // namespace host
 }  // namespace korvo

@@ -44,6 +44,7 @@ int main(int argc, char** argv) {
         addDemoCommand(app, common),   addListenCommand(app, common),    addSayCommand(app, common),
         addSweepCommand(app, common),  addHandshakeCommand(app, common), addMonitorCommand(app, common),
         addDevicesCommand(app, common), addScanCommand(app, common),    addCalibrateCommand(app, common),
+        addSpectrogramCommand(app, common),
     };
     for (Command& c : commands) addCommonFlags(c.app, common);
 
@@ -57,7 +58,7 @@ int main(int argc, char** argv) {
             if (rest.front().rfind("-", 0) == 0) {
                 errf("unknown option '%s'", rest.front().c_str());
             } else {
-                errf("unknown command '%s' (expected demo, listen, say, sweep, handshake, monitor, devices, scan or calibrate)",
+                errf("unknown command '%s' (expected demo, listen, say, sweep, handshake, monitor, devices, scan, calibrate or spectrogram)",
                      rest.front().c_str());
             }
         } else {

@@ -1,7 +1,9 @@
 // The host's hearing: its decision on read-outs written by the test, the builtin
 // decision's guard, the calibration's proposals and the simulated capture and analysis.
+#include <algorithm>
 #include <array>
 #include <cmath>
+#include <random>
 #include <set>
 #include <vector>
 
@@ -11,6 +13,7 @@
 #include "host/hearing/Calibration.h"
 #include "host/hearing/CodeEvents.h"
 #include "host/hearing/HostDecision.h"
+#include "host/hearing/LevelledEar.h"
 #include "host/hearing/SimulatedEar.h"
 
 namespace {
@@ -251,6 +254,42 @@ TEST(SimulatedEar, TurnsAnalyseTheRingAsItStoodAndRunsOfFiveFramesAtEachPhase) {
     // Some phase analyses any given frame.
     EXPECT_EQ(everAnalysed.size(), 10u);
     EXPECT_GE(patterns.size(), 5u);
+}
+
+// Read at the open level with the level applied by the host, a read-out is the one the
+// library gives at that level, entry for entry, in both read-outs.
+TEST(LevelledEar, ShowsTheDecoderWhatTheReadOutShowsAtItsLevel) {
+    std::mt19937 noise(11);
+    std::normal_distribution<double> sample(0.0, 300.0);
+    for (const int level : {-100, -5, 0, 37, 62}) {
+        SimulatedEar atLevel(3);
+        SimulatedEar open(3);
+        atLevel.setDetectionLevel(level);
+        open.setDetectionLevel(level);
+        LevelledEar levelled(open);
+        EXPECT_EQ(levelled.detectionLevel(), level);
+        std::vector<int16_t> frame(korvo::kFrameSamples);
+        long hidden = 0;  // entries the open read-out keeps and the level hides
+        for (int f = 0; f < 40; ++f) {
+            for (int i = 0; i < korvo::kFrameSamples; ++i) {
+                const double tone = f % 7 < 3 ? 4000.0 * std::sin(2.0 * M_PI * korvo::codeHz(f % 18) * i / 44100.0) : 0.0;
+                frame[size_t(i)] = int16_t(std::lrint(tone + (f % 5 == 4 ? 0.0 : sample(noise))));
+            }
+            atLevel.step(frame.data());
+            open.step(frame.data());
+            Levels want{}, got{}, seen{};
+            EXPECT_EQ(levelled.spectrum(got.data()), atLevel.spectrum(want.data()));
+            EXPECT_EQ(got, want) << "level " << level << ", frame " << f;
+            want.fill(7.0f);
+            got.fill(7.0f);
+            atLevel.maskedSpectrum(want.data());
+            levelled.maskedSpectrum(got.data());
+            EXPECT_EQ(got, want) << "level " << level << ", frame " << f;
+            levelled.openSpectrum(seen.data());
+            hidden += std::count_if(seen.begin(), seen.end(), [&](float v) { return v != 0.0f && v <= level; });
+        }
+        EXPECT_TRUE(level <= 0 || hidden > 0) << "level " << level;
+    }
 }
 
 }  // namespace

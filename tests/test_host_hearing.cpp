@@ -1,5 +1,8 @@
 // How the soundmeter command hears: scan against a live listen on the same recordings,
-// the host's decision on sox-made recordings, and a calibrated level in a noisy room.
+// the host's decision on sox-made recordings, a calibrated level in a noisy room, and
+// what the spectrogram and the monitor show of a recording.
+#include <cairo.h>
+
 #include <algorithm>
 #include <cmath>
 #include <cstdlib>
@@ -214,6 +217,100 @@ TEST_F(HostHearing, AFortyMillisecondToneIsHeardWhereAnAnalysedFrameHoldsIt) {
     }
     // Half the frames are never analysed: at some phases no analysed frame holds the tone.
     EXPECT_GE(phasesHeard, 5);
+}
+
+// The luminance (0..255) of a pixel of a decoded picture.
+struct Picture {
+    explicit Picture(const std::string& png) : surface(cairo_image_surface_create_from_png(png.c_str())) {}
+    ~Picture() { cairo_surface_destroy(surface); }
+    bool ok() const { return cairo_surface_status(surface) == CAIRO_STATUS_SUCCESS; }
+    int width() const { return cairo_image_surface_get_width(surface); }
+    int height() const { return cairo_image_surface_get_height(surface); }
+    double luminance(int x, int y) const {
+        const unsigned char* row = cairo_image_surface_get_data(surface) + y * cairo_image_surface_get_stride(surface);
+        const uint32_t p = reinterpret_cast<const uint32_t*>(row)[x];
+        return 0.2126 * ((p >> 16) & 0xff) + 0.7152 * ((p >> 8) & 0xff) + 0.0722 * (p & 0xff);
+    }
+    cairo_surface_t* surface;
+};
+
+TEST_F(HostHearing, TheSpectrogramShowsEachCodeInItsBandWhileItSounds) {
+    std::vector<double> starts;
+    const std::vector<Tone> tones = {{3, 400}, {10, 400}, {17, 400}};
+    const std::string file = record("three", tones, 10.0, 500, "whitenoise", &starts);
+    const std::string png = path("three.png");
+    ProcessResult r = runHost(kHost, {"--json", "spectrogram", file, "--png", png}, kRunMs);
+    ASSERT_EQ(r.status, 0) << r.err;
+    EXPECT_EQ(codesOf(heardIn(r)).substr(0, 2), "3@");
+    std::string codes;
+    for (const Heard& h : heardIn(r)) codes += std::to_string(h.code) + " ";
+    EXPECT_EQ(codes, "3 10 17 ");
+
+    // One column of 2 pixels per capture step: the file's frames and 22 steps after its end,
+    // 480 pixels at least; margins 80 left and 190 right, 48 above and below 510 rows of bins.
+    const ProcessResult samples = runHost("/usr/bin/soxi", {"-s", file}, kRunMs);
+    const int columns = (std::stoi(samples.out) + 511) / 512 + 21;
+    ASSERT_LT(columns, 480);
+    const int columnPixels = (480 + columns - 1) / columns;
+    Picture picture(png);
+    ASSERT_TRUE(picture.ok()) << cairo_status_to_string(cairo_surface_status(picture.surface));
+    EXPECT_EQ(picture.width(), 80 + columns * columnPixels + 190);
+    EXPECT_EQ(picture.height(), 48 + 510 + 48);
+
+    const auto x = [&](double seconds) { return 80 + static_cast<int>(seconds / kFrameSeconds) * columnPixels; };
+    const auto y = [](int bin) { return 48 + 2 * (255 - bin); };
+    const auto band = [&](double seconds, int bin) {
+        return std::max({picture.luminance(x(seconds), y(bin)), picture.luminance(x(seconds), y(bin) + 1)});
+    };
+    for (size_t i = 0; i < tones.size(); ++i) {
+        const int bin = 30 + 10 * tones[i].code;
+        const double during = starts[i] + 0.2;
+        const double after = starts[i] + 0.55;  // a tone's read-out lasts a few frames longer
+        // Around: bins 5..12 below the code's, at the same time (the tone's leakage is far under).
+        double around = 0.0;
+        for (int b = bin - 12; b <= bin - 5; ++b) around = std::max(around, band(during, b));
+        EXPECT_GT(band(during, bin), around + 40.0) << "code " << tones[i].code;
+        EXPECT_GT(band(during, bin), band(after, bin) + 40.0) << "code " << tones[i].code;
+        EXPECT_GT(band(during, bin), band(0.3, bin) + 40.0) << "code " << tones[i].code;
+    }
+
+    // From the microphone route in real time: the same codes, and a picture.
+    const std::string live = path("live.png");
+    r = runHost(kHost, {"--json", "spectrogram", "--mic", "wav:" + file, "--png", live, "--seconds", "30"}, kRunMs);
+    ASSERT_EQ(r.status, 0) << r.err;
+    codes.clear();
+    for (const Heard& h : heardIn(r)) codes += std::to_string(h.code) + " ";
+    EXPECT_EQ(codes, "3 10 17 ");
+    EXPECT_TRUE(Picture(live).ok());
+
+    // A picture that cannot be written is refused before anything is heard.
+    r = runHost(kHost, {"spectrogram", file, "--png", path("missing/x.png")}, kRunMs);
+    EXPECT_EQ(r.status, 2);
+    EXPECT_NE(r.err.find("missing/x.png: cannot write: No such file or directory"), std::string::npos) << r.err;
+}
+
+TEST_F(HostHearing, TheMonitorShowsPeaksFloorsTheLevelAndTheCodesHeard) {
+    const std::string file = record("monitor", {{3, 400}, {10, 400}}, 10.0, 500);
+    const ProcessResult r = runHost(kHost, {"monitor", "--mic", "wav:" + file, "--level", "30"}, kRunMs);
+    ASSERT_EQ(r.status, 0) << r.err;
+    // The last frame: frames follow each other when the output is not a terminal.
+    const std::vector<std::string> lines = linesOf(r.out);
+    const auto last = std::find_if(lines.rbegin(), lines.rend(), [](const std::string& l) { return l.find(" s  detection level 30") != std::string::npos; });
+    ASSERT_NE(last, lines.rend()) << r.out;
+    const std::vector<std::string> frame(last.base() - 1, lines.end());
+    ASSERT_GE(frame.size(), 27u) << r.out;  // time, legend, 23 codes, a note, heard
+    std::smatch m;
+    const std::regex row("^code +([0-9]+) +[0-9]+ Hz ([-#.>|]{50}) +([0-9.]+) +([0-9.]+) +([0-9.]+)$");
+    for (int c = 0; c < 23; ++c) {
+        ASSERT_TRUE(std::regex_match(frame[2 + c], m, row)) << frame[2 + c];
+        // The level line at 30 (column 15) wherever nothing else covers it, and the noise's floor.
+        const std::string bar = m[2];
+        EXPECT_TRUE(bar[15] == '|' || bar[15] == '#' || bar[15] == '>') << bar;
+        EXPECT_GT(std::stod(m[4]), 20.0) << frame[2 + c];
+    }
+    EXPECT_TRUE(std::regex_search(frame[26], m, std::regex("^heard: code 10 \\(11180 Hz\\) ([0-9.]+) s ago; code 3 \\(5160 Hz\\) ([0-9.]+) s ago$")))
+        << frame[26];
+    EXPECT_NEAR(std::stod(m[2]) - std::stod(m[1]), 0.7, 0.1);
 }
 
 TEST(HostCalibration, TheProposedLevelKeepsANoisyRoomQuietAndTonesHeard) {

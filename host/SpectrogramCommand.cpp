@@ -1,0 +1,186 @@
+// soundmeter spectrogram: a picture of what a listener's read-out saw, from a
+// microphone route in real time or from a file as fast as the processor allows.
+//
+// Both read the read-out at the open level, so the picture shows the room under the
+// detection level too; the decoder hears with the level applied (LevelledEar), the
+// same codes at the same times as listen or scan.
+#include <unistd.h>
+
+#include <CLI/CLI.hpp>
+
+#include <cerrno>
+#include <cmath>
+#include <cstring>
+
+#include <korvo/platform/Recording.h>
+#include <korvo/platform/Routes.h>
+
+#include "host/Clock.h"
+#include "host/CodePlan.h"
+#include "host/Environment.h"
+#include "host/FileWatch.h"
+#include "host/Hearing.h"
+#include "host/JsonEvent.h"
+#include "host/OfflineRun.h"
+#include "host/Options.h"
+#include "host/Output.h"
+#include "host/Session.h"
+#include "host/picture/SpectrogramPicture.h"
+
+namespace korvo {
+namespace host {
+namespace {
+
+struct SpectrogramOptions {
+    std::string file;  // empty: the microphone route
+    std::string png;
+    double seconds = 0.0;  // 0: the whole file, or kDefaultLiveSeconds of a microphone
+    LevelChoice level;
+    DecoderKind decoder = DecoderKind::Host;
+    int phase = 0;
+};
+
+constexpr double kDefaultLiveSeconds = 10.0;
+
+int64_t stepsIn(double seconds) {
+    return static_cast<int64_t>(std::ceil(seconds * korvo::kSampleRate / korvo::kFrameSamples));
+}
+
+void noteHeard(Spectrogram& picture, CodeSet begun, int64_t step, double t, int* count) {
+    for (int c = 0; c < kCodeCount; ++c) {
+        if (!(begun & codeBit(c))) continue;
+        picture.addHeard(step, c);
+        printHeard(c, t);
+        ++*count;
+    }
+}
+
+// The picture's file can be written: found out before a long capture, not after it.
+bool writable(const std::string& path, std::string* cause) {
+    const size_t slash = path.rfind('/');
+    const std::string dir = slash == std::string::npos ? "." : slash == 0 ? "/" : path.substr(0, slash);
+    if (access(path.c_str(), F_OK) == 0 ? access(path.c_str(), W_OK) == 0 : access(dir.c_str(), W_OK) == 0) {
+        return true;
+    }
+    *cause = std::string("cannot write: ") + strerror(errno);
+    return false;
+}
+
+int finish(const Spectrogram& picture, const PictureTitle& title, const std::string& png, int count) {
+    std::string cause;
+    if (!writeSpectrogramPng(picture, title, png, &cause)) {
+        errf("spectrogram %s: %s", png.c_str(), cause.c_str());
+        return 1;
+    }
+    resultf(JsonEvent("picture").add("png", png).add("audio_s", title.seconds).add("codes", count),
+            "wrote %s: %.1f s of %s, %s heard\n", png.c_str(), title.seconds, title.source.c_str(),
+            plural(count, "code").c_str());
+    return 0;
+}
+
+int fromFile(const CommonOptions& common, const SpectrogramOptions& o) {
+    applyLogSettings(common.verbose);
+    std::string cause;
+    std::unique_ptr<korvo::platform::Recording> recording =
+        korvo::platform::Recording::open(o.file, korvo::kSampleRate, &cause);
+    if (!recording) {
+        errf("spectrogram %s: %s", o.file.c_str(), cause.c_str());
+        return 2;
+    }
+    double length = recording->totalSeconds();
+    if (o.seconds > 0 && (length <= 0 || o.seconds < length)) length = o.seconds;
+    Spectrogram picture(stepsIn(length) + kFileTailSteps);
+    OfflineListener listener(o.decoder, o.phase, /*seeAll=*/true);
+    if (o.level.given && o.level.automatic) listener.calibrateFirst();
+    if (o.level.given && !o.level.automatic) listener.setLevel(o.level.value);
+
+    int count = 0;
+    OfflineRun run;
+    float levels[korvo::kSpectrumBins] = {};
+    const bool read = hearRecording(*recording, listener, o.seconds, [&](CodeSet begun) {
+        // Warm-up and calibration steps stay blank: the listener is not hearing yet.
+        const bool listening = listener.steps() > kWarmUpSteps && !(o.level.automatic && !listener.calibrated());
+        if (!listening) return;
+        listener.seenSpectrum(levels);
+        picture.addStep(listener.steps(), levels);
+        noteHeard(picture, begun, listener.steps(), listener.seconds(), &count);
+    }, &run, &cause);
+    if (!read) {
+        errf("spectrogram %s: %s", o.file.c_str(), cause.c_str());
+        return 1;
+    }
+    if (run.interrupted) return 130;
+    return finish(picture, {o.file, run.audioSeconds, listener.level(), o.decoder}, o.png, count);
+}
+
+int fromMicrophone(const CommonOptions& common, const SpectrogramOptions& o) {
+    Session session(common);
+    DeviceSettings settings;
+    settings.role = 1;
+    settings.routes.mic = true;
+    if (int status = session.open(settings)) return status;
+    Device& device = session.device();
+    Hearing hearing(device, o.decoder, /*seeAll=*/true);
+    Outcome outcome = hearing.applyLevel(o.level);
+
+    const double seconds = o.seconds > 0 ? o.seconds : kDefaultLiveSeconds;
+    Spectrogram picture(device.steps() + stepsIn(seconds));
+    FileWatch file(false);
+    int count = 0;
+    float levels[korvo::kSpectrumBins] = {};
+    const int64_t start = monotonicMs();
+    const int64_t end = start + static_cast<int64_t>(seconds * 1000.0);
+    for (int64_t now = start; outcome == Outcome::Done && now < end && !file.over(now); now = monotonicMs()) {
+        if ((outcome = session.interruption()) != Outcome::Done) break;
+        const CodeSet begun = hearing.step();
+        hearing.seenSpectrum(levels);
+        picture.addStep(device.steps(), levels);
+        noteHeard(picture, begun, device.steps(), hearing.seconds(), &count);
+    }
+    const PictureTitle title{korvo::platform::micRoute(), stepSeconds(device.steps()), hearing.level(), o.decoder};
+    session.close();
+    // A route that failed gives no picture: it would show a silence nobody heard.
+    if (outcome == Outcome::RouteFailed) return exitStatusOf(outcome);
+    const int written = finish(picture, title, o.png, count);
+    return outcome == Outcome::Done ? written : exitStatusOf(outcome);
+}
+
+int runSpectrogram(const CommonOptions& common, const SpectrogramOptions& o) {
+    if (!o.file.empty() && !common.mic.empty()) {
+        errf("spectrogram: give a FILE or --mic, not both");
+        return 2;
+    }
+    std::string cause;
+    if (!writable(o.png, &cause)) {
+        errf("spectrogram %s: %s", o.png.c_str(), cause.c_str());
+        return 2;
+    }
+    return o.file.empty() ? fromMicrophone(common, o) : fromFile(common, o);
+}
+
+}  // namespace
+
+Command addSpectrogramCommand(CLI::App& app, CommonOptions& common) {
+    auto options = std::make_shared<SpectrogramOptions>();
+    CLI::App* sub = app.add_subcommand(
+        "spectrogram",
+        "Draw a PNG picture of what a listener's read-out saw, frequency against time: from a recording as fast "
+        "as the processor allows (FILE), or from the microphone route in real time (--mic). The code bands are "
+        "labelled, each code heard is marked where it was heard, and the colour scale shows the detection level.");
+    sub->add_option("FILE", options->file, "a recording to draw (anything libsndfile reads; - for standard input)");
+    sub->add_option("--png", options->png, "the picture to write")->required();
+    sub->add_option("--seconds", options->seconds,
+                    "how long to listen to the microphone (default 10), or how much of the file to draw (default "
+                    "all of it)")
+        ->check(finiteRange(0.0, 86400.0));
+    addLevelOption(sub, &options->level, "detection level: spectrum levels at or below it count as silence");
+    addDecoderOption(sub, &options->decoder);
+    sub->add_option("--phase", options->phase, "for a FILE: where the analysis stands against the capture, 0..9 (see scan)")
+        ->check(CLI::Range(0, kPhases - 1))
+        ->capture_default_str();
+    addRouteOptions(sub, common);
+    return {sub, [&common, options] { return runSpectrogram(common, *options); }};
+}
+
+}  // namespace host
+}  // namespace korvo
