@@ -20,7 +20,7 @@ void addCommonFlags(CLI::App* app, CommonOptions& common) {
     app->add_flag("-v,--verbose", common.verbose,
                   "platform log on stderr (-v: debug, -vv: verbose) and the plug-in's own stdout lines");
     app->add_flag("-q,--quiet", common.quiet, "print only results and errors");
-    app->add_flag("--json", common.json, "print one JSON object per event (heard, said, exchange, summary)");
+    app->add_flag("--json", common.json, "print one JSON object per event (heard, said, exchange, summary, picture)");
     app->add_option("--plugin", common.plugin,
                     "plug-in to load (default: KORVO_PLUGIN, else ../lib/libkorvo_soundmeter.so next to "
                     "this program)");

@@ -11,7 +11,7 @@ packages=(
   libsndfile1-dev portaudio19-dev libcli11-dev libfftw3-dev
   libsamplerate0-dev
   # spectrogram pictures
-  libcairo2-dev fonts-dejavu-core
+  libcairo2-dev libfontconfig-dev fonts-dejavu-core
   # the manual page is made from the help texts; the tests render it with man
   help2man man-db
   # the recording tests make their files with sox; its base formats hold FLAC and Ogg

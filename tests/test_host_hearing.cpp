@@ -318,7 +318,7 @@ TEST_F(HostHearing, TheMonitorShowsPeaksFloorsTheLevelAndTheCodesHeard) {
     }
     EXPECT_TRUE(std::regex_search(frame[26], m, std::regex("^heard: code 10 \\(11180 Hz\\) ([0-9.]+) s ago; code 3 \\(5160 Hz\\) ([0-9.]+) s ago$")))
         << frame[26];
-    EXPECT_NEAR(std::stod(m[2]) - std::stod(m[1]), 0.7, 0.1);
+    EXPECT_NEAR(std::stod(m[2]) - std::stod(m[1]), 0.7, 0.3);  // ages on the wall clock of a loaded machine
 }
 
 TEST(HostCalibration, TheProposedLevelKeepsANoisyRoomQuietAndTonesHeard) {

@@ -1,6 +1,7 @@
 #include "host/picture/SpectrogramPicture.h"
 
 #include <cairo.h>
+#include <fontconfig/fontconfig.h>
 
 #include <algorithm>
 #include <array>
@@ -240,8 +241,18 @@ SpectrogramLayout::SpectrogramLayout(int columns)
       width(kLeftMargin + plotWidth + kRightMargin),
       height(kTopMargin + kPlotHeight + kBottomMargin) {}
 
+// The text's fonts come from caches that cairo and the font configuration keep for the
+// whole process; a command draws one picture, so they are let go once it is drawn.
+struct FontCaches {
+    ~FontCaches() {
+        cairo_debug_reset_static_data();
+        FcFini();
+    }
+};
+
 bool writeSpectrogramPng(const Spectrogram& sg, const PictureTitle& title, const std::string& path,
                          std::string* cause) {
+    const FontCaches releasedAfterDrawing;
     const SpectrogramLayout at(sg.columns());
     std::unique_ptr<cairo_surface_t, decltype(&cairo_surface_destroy)> surface(
         cairo_image_surface_create(CAIRO_FORMAT_RGB24, at.width, at.height), cairo_surface_destroy);
