@@ -12,8 +12,7 @@ Hearing::Hearing(Device& device, DecoderKind kind, bool seeAll)
     : mDevice(device),
       mKind(kind),
       mEar(device.meter()),
-      mLevelled(seeAll ? std::make_unique<LevelledEar>(mEar) : nullptr),
-      mDecisionEar(seeAll ? static_cast<Ear*>(mLevelled.get()) : &mEar),
+      mDecisionEar(mEar, seeAll),
       mDecoder(makeDecoder(kind)) {}
 
 CodeSet Hearing::step() {

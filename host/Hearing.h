@@ -47,8 +47,7 @@ private:
     Device& mDevice;
     DecoderKind mKind;
     MeterEar mEar;
-    std::unique_ptr<LevelledEar> mLevelled;
-    Ear* mDecisionEar;
+    DecisionEar mDecisionEar;
     std::unique_ptr<Decoder> mDecoder;
     CodeEvents mEvents;
     CodeSet mHeard = 0;

@@ -6,6 +6,8 @@
 // read-outs do (an entry keeps its level only when it is strictly greater). For any
 // level from the open level up, the decoder sees what a read-out at that level shows.
 #pragma once
+#include <memory>
+
 #include "host/hearing/Calibration.h"
 #include "host/hearing/Ear.h"
 
@@ -40,6 +42,20 @@ private:
 
     Ear& mOpen;
     int mLevel;
+};
+
+// The ear a decoder hears through: the ear itself, or, to see every bin, a LevelledEar over it.
+class DecisionEar {
+public:
+    DecisionEar(Ear& ear, bool seeAll)
+        : mLevelled(seeAll ? std::make_unique<LevelledEar>(ear) : nullptr),
+          mEar(mLevelled ? static_cast<Ear&>(*mLevelled) : ear) {}
+    Ear& operator*() { return mEar; }
+    Ear* operator->() { return &mEar; }
+
+private:
+    std::unique_ptr<LevelledEar> mLevelled;
+    Ear& mEar;
 };
 
 }  // namespace host

@@ -6,8 +6,7 @@ namespace host {
 OfflineListener::OfflineListener(DecoderKind kind, int phase, bool seeAll)
     : mKind(kind),
       mEar(phase),
-      mLevelled(seeAll ? std::make_unique<LevelledEar>(mEar) : nullptr),
-      mDecisionEar(seeAll ? static_cast<Ear*>(mLevelled.get()) : &mEar),
+      mDecisionEar(mEar, seeAll),
       mDecoder(makeDecoder(kind)) {}
 
 CodeSet OfflineListener::step(const int16_t* frame) {

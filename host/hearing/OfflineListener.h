@@ -43,8 +43,7 @@ public:
 private:
     DecoderKind mKind;
     SimulatedEar mEar;
-    std::unique_ptr<LevelledEar> mLevelled;
-    Ear* mDecisionEar;
+    DecisionEar mDecisionEar;
     std::unique_ptr<Decoder> mDecoder;
     CodeEvents mEvents;
     CodeSet mHeard = 0;
