@@ -4,13 +4,10 @@
 // Both read the read-out at the open level, so the picture shows the room under the
 // detection level too; the decoder hears with the level applied (LevelledEar), the
 // same codes at the same times as listen or scan.
-#include <unistd.h>
 
 #include <CLI/CLI.hpp>
 
-#include <cerrno>
 #include <cmath>
-#include <cstring>
 
 #include <korvo/platform/Recording.h>
 #include <korvo/platform/Routes.h>
@@ -25,6 +22,7 @@
 #include "host/Options.h"
 #include "host/Output.h"
 #include "host/Session.h"
+#include "host/picture/PictureFile.h"
 #include "host/picture/SpectrogramPicture.h"
 
 namespace korvo {
@@ -53,17 +51,6 @@ void noteHeard(Spectrogram& picture, CodeSet begun, int64_t step, double t, int*
         printHeard(c, t);
         ++*count;
     }
-}
-
-// The picture's file can be written: found out before a long capture, not after it.
-bool writable(const std::string& path, std::string* cause) {
-    const size_t slash = path.rfind('/');
-    const std::string dir = slash == std::string::npos ? "." : slash == 0 ? "/" : path.substr(0, slash);
-    if (access(path.c_str(), F_OK) == 0 ? access(path.c_str(), W_OK) == 0 : access(dir.c_str(), W_OK) == 0) {
-        return true;
-    }
-    *cause = std::string("cannot write: ") + strerror(errno);
-    return false;
 }
 
 int finish(const Spectrogram& picture, const PictureTitle& title, const std::string& png, int count) {
@@ -151,7 +138,7 @@ int runSpectrogram(const CommonOptions& common, const SpectrogramOptions& o) {
         return 2;
     }
     std::string cause;
-    if (!writable(o.png, &cause)) {
+    if (!checkPictureFile(o.png, &cause)) {
         errf("spectrogram %s: %s", o.png.c_str(), cause.c_str());
         return 2;
     }

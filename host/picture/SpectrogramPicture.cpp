@@ -12,6 +12,7 @@
 #include <memory>
 
 #include "host/hearing/StepClock.h"
+#include "host/picture/PictureFile.h"
 
 namespace korvo {
 namespace host {
@@ -276,16 +277,13 @@ bool writeSpectrogramPng(const Spectrogram& sg, const PictureTitle& title, const
         return false;
     }
 
-    FILE* out = fopen(path.c_str(), "wb");
-    if (out == nullptr) {
-        *cause = std::string("cannot write: ") + strerror(errno);
-        return false;
-    }
+    PictureFile file;
+    if (!file.open(path, cause)) return false;
     // The stream callback keeps the system's own reason for a failed write.
     struct Sink {
         FILE* file;
         int error;
-    } sink{out, 0};
+    } sink{file.stream(), 0};
     const cairo_status_t status = cairo_surface_write_to_png_stream(
         surface.get(),
         [](void* closure, const unsigned char* data, unsigned int length) {
@@ -295,15 +293,11 @@ bool writeSpectrogramPng(const Spectrogram& sg, const PictureTitle& title, const
             return CAIRO_STATUS_WRITE_ERROR;
         },
         &sink);
-    const bool closed = fclose(out) == 0;
-    if (status != CAIRO_STATUS_SUCCESS || !closed) {
-        const int err = sink.error != 0 ? sink.error : errno;
-        *cause = std::string("cannot write: ") + (status == CAIRO_STATUS_SUCCESS || err != 0 ? strerror(err)
-                                                                                             : cairo_status_to_string(status));
-        remove(path.c_str());  // no half-written picture left behind
-        return false;
+    if (status != CAIRO_STATUS_SUCCESS) {
+        *cause = std::string("cannot write: ") + (sink.error != 0 ? strerror(sink.error) : cairo_status_to_string(status));
+        return false;  // the new file goes with `file`; whatever was at the path stays
     }
-    return true;
+    return file.commit(cause);
 }
 
 }  // namespace host
