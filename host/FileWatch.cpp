@@ -20,8 +20,12 @@ bool FileWatch::over(int64_t now) {
     if (p.ended && mEndedAt < 0) mEndedAt = now;
     if (mTerminal && now >= mNextShow) {
         mNextShow = now + kProgressEveryMs;
-        outf("\r  %.1f s of %.1f s in the file, %.1f s left\x1b[K", p.seconds, p.totalSeconds,
-             p.totalSeconds > p.seconds ? p.totalSeconds - p.seconds : 0.0);
+        if (p.totalSeconds > 0) {
+            outf("\r  %.1f s of %.1f s in the file, %.1f s left\x1b[K", p.seconds, p.totalSeconds,
+                 p.totalSeconds > p.seconds ? p.totalSeconds - p.seconds : 0.0);
+        } else {
+            outf("\r  %.1f s of the stream\x1b[K", p.seconds);
+        }
         mShown = true;
     }
     return mEndedAt >= 0 && now >= mEndedAt + kFileTailMs;

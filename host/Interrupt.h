@@ -8,6 +8,9 @@ namespace host {
 void installInterruptHandlers();  // SIGINT and SIGTERM raise the flag; SIGPIPE is ignored
 bool interrupted();
 int interruptSignal();  // the signal that raised the flag, 0 if none
+// For a process driven by a parent that reports its ending: no line on an interruption.
+void leaveInterruptionsToParent();
+bool interruptionsLeftToParent();
 
 }  // namespace host
 }  // namespace korvo

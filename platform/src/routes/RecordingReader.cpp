@@ -1,4 +1,5 @@
 #include "routes/RecordingReader.h"
+#include "routes/RouteFactories.h"
 
 #include <algorithm>
 #include <cmath>
@@ -39,7 +40,7 @@ std::unique_ptr<Recording> Recording::open(const std::string& path, uint32_t rat
     std::string why;
     if (rate == 0) {
         why = "cannot open: no sample rate";
-    } else if (input->open(path, &why)) {
+    } else if (checkRecording(path, rate, &why) && input->open(path, &why)) {
         auto reader = std::make_unique<RecordingReader>(std::move(input));
         if (reader->setRate(rate, &why)) return reader;
     }

@@ -16,7 +16,17 @@ ResampledInput::~ResampledInput() {
     if (mState) src_delete(mState);
 }
 
+bool ResampledInput::convertible(int fileRate, uint32_t rate, std::string* cause) {
+    // The converter takes ratios from 1/256 to 256.
+    const double ratio = static_cast<double>(rate) / fileRate;
+    if (ratio >= 1.0 / 256 && ratio <= 256.0) return true;
+    *cause = "cannot convert the rate: " + std::to_string(fileRate) + " Hz is outside " +
+             std::to_string((rate + 255) / 256) + ".." + std::to_string(uint64_t{rate} * 256) + " Hz";
+    return false;
+}
+
 bool ResampledInput::setRate(uint32_t rate, std::string* cause) {
+    if (!convertible(mInput.rate(), rate, cause)) return false;
     const double ratio = static_cast<double>(rate) / mInput.rate();
     if (!mState && ratio == 1.0) return true;
     if (!mState) {

@@ -18,6 +18,8 @@ public:
     ResampledInput(const ResampledInput&) = delete;
     ResampledInput& operator=(const ResampledInput&) = delete;
 
+    // Whether a recording at `fileRate` can be delivered at `rate`; false with the cause.
+    static bool convertible(int fileRate, uint32_t rate, std::string* cause);
     // Delivers at `rate` from now on, going on where the samples were; false with the cause.
     bool setRate(uint32_t rate, std::string* cause);
     // Up to `count` samples at the rate set: the number written to `out`, 0 after the

@@ -20,6 +20,9 @@ std::unique_ptr<OutputRoute> makeCardOutputRoute(const std::string& device, std:
 
 // Whether a route could be used now, leaving nothing behind; false with the cause.
 bool checkWavCapture(const std::string& path, std::string* reason);
+// The checks every reader of a recording makes first: it opens, decodes and can be
+// converted to `rate`; false with the cause in a few words.
+bool checkRecording(const std::string& path, uint32_t rate, std::string* reason);
 bool checkWavOutput(const std::string& path, std::string* reason);
 bool checkSimRoute(const std::string& room, bool speaker, std::string* reason);
 bool checkCardRoute(const std::string& device, bool input, std::string* reason);

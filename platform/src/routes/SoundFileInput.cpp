@@ -7,7 +7,8 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
-#include <mutex>
+
+#include "routes/StreamSource.h"
 
 namespace korvo {
 namespace platform {
@@ -23,40 +24,17 @@ std::string sndfileReason(SNDFILE* file) {
 
 namespace {
 
-// Standard input is a pipe that cannot seek, and FLAC or Ogg need to seek: it is read
-// whole into memory, once per process, and every route or check decodes that copy.
-std::shared_ptr<const std::string> standardInput(std::string* cause) {
-    static std::mutex lock;
-    static std::shared_ptr<const std::string> bytes;
-    static std::string failure;
-    std::lock_guard<std::mutex> guard(lock);
-    if (!bytes && failure.empty()) {
-        auto text = std::make_shared<std::string>();
-        char buf[65536];
-        for (;;) {
-            const ssize_t n = ::read(STDIN_FILENO, buf, sizeof buf);
-            if (n < 0 && errno == EINTR) continue;
-            if (n < 0) {
-                failure = std::string("cannot open: ") + std::strerror(errno);
-                break;
-            }
-            if (n == 0) {
-                bytes = std::move(text);
-                break;
-            }
-            text->append(buf, static_cast<size_t>(n));
-        }
-    }
-    if (!bytes) *cause = failure;
-    return bytes;
-}
+// FLAC cannot be decoded from a pipe: such a stream is read whole into memory, up to this.
+constexpr size_t kMaxWholeStream = size_t{256} << 20;
+
+std::string streamName(const std::string& path) { return path == "-" ? "standard input" : "the stream"; }
 
 }  // namespace
 
 // libsndfile's virtual I/O over the bytes of standard input.
 struct MemoryIo {
     static SoundFileInput& self(void* user) { return *static_cast<SoundFileInput*>(user); }
-    static sf_count_t length(void* user) { return static_cast<sf_count_t>(self(user).mBytes->size()); }
+    static sf_count_t length(void* user) { return static_cast<sf_count_t>(self(user).mBytes.size()); }
     static sf_count_t seek(sf_count_t offset, int whence, void* user) {
         SoundFileInput& in = self(user);
         const sf_count_t base = whence == SEEK_CUR ? in.mOffset : whence == SEEK_END ? length(user) : 0;
@@ -67,7 +45,7 @@ struct MemoryIo {
         SoundFileInput& in = self(user);
         const sf_count_t n = std::min(count, length(user) - in.mOffset);
         if (n <= 0) return 0;
-        std::memcpy(ptr, in.mBytes->data() + in.mOffset, static_cast<size_t>(n));
+        std::memcpy(ptr, in.mBytes.data() + in.mOffset, static_cast<size_t>(n));
         in.mOffset += n;
         return n;
     }
@@ -76,20 +54,65 @@ struct MemoryIo {
 };
 
 SoundFileInput::~SoundFileInput() {
-    if (mFile) sf_close(mFile);
+    if (mFile) sf_close(mFile);  // closes the pump's pipe first, so the pump ends
+    mPump.reset();
 }
 
-bool SoundFileInput::open(const std::string& path, std::string* cause) {
-    if (path == "-") {
-        mBytes = standardInput(cause);
-        if (!mBytes) return false;
-        if (mBytes->empty()) {
-            *cause = "cannot decode: standard input is empty";
+bool SoundFileInput::openStream(const std::string& path, std::string* cause) {
+    std::shared_ptr<StreamSource> source = StreamSource::of(path, cause);
+    if (!source) return false;
+    char magic[4];
+    size_t have = 0;
+    for (ssize_t n = 1; have < sizeof magic && n > 0; have += static_cast<size_t>(std::max<ssize_t>(n, 0))) {
+        n = source->readAt(have, magic + have, sizeof magic - have);
+        if (n < 0) {
+            *cause = errno == EINVAL ? "cannot decode: " + streamName(path) + " was read once already"
+                                     : std::string("cannot open: ") + std::strerror(errno);
             return false;
         }
+    }
+    if (recordingsInterrupted()) {
+        *cause = "interrupted";
+        return false;
+    }
+    if (have == 0) {
+        *cause = "cannot decode: " + streamName(path) + " is empty";
+        return false;
+    }
+    mLengthKnown = false;
+    if (have == sizeof magic && std::memcmp(magic, "fLaC", sizeof magic) == 0) {
+        char block[65536];
+        for (ssize_t n; (n = source->readAt(mBytes.size(), block, sizeof block)) > 0;) {
+            if (mBytes.size() + static_cast<size_t>(n) > kMaxWholeStream) {
+                *cause = "cannot decode: a FLAC stream longer than 256 MiB must come from a file";
+                return false;
+            }
+            mBytes.append(block, static_cast<size_t>(n));
+        }
+        if (recordingsInterrupted()) {
+            *cause = "interrupted";
+            return false;
+        }
+        mLengthKnown = true;
         static SF_VIRTUAL_IO io = {MemoryIo::length, MemoryIo::seek, MemoryIo::read, MemoryIo::write,
                                    MemoryIo::tell};
         mFile = sf_open_virtual(&io, SFM_READ, &mInfo, this);
+        return true;
+    }
+    // Everything else decodes from a pipe as it comes, in bounded memory.
+    int fds[2];
+    if (pipe2(fds, O_CLOEXEC) != 0) {
+        *cause = std::string("cannot open: ") + std::strerror(errno);
+        return false;
+    }
+    mPump = std::make_unique<StreamPump>(std::move(source), fds[1]);
+    mFile = sf_open_fd(fds[0], SFM_READ, &mInfo, SF_TRUE);  // closes fds[0] when it fails
+    return true;
+}
+
+bool SoundFileInput::open(const std::string& path, std::string* cause) {
+    if (StreamSource::isStream(path)) {
+        if (!openStream(path, cause)) return false;
     } else {
         // Opened here rather than by libsndfile, so that the cause is the system's own words.
         const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
@@ -132,7 +155,7 @@ sf_count_t SoundFileInput::readMono(float* out, sf_count_t count, std::string* c
             *cause = "cannot decode: " + sndfileReason(mFile);
             return -1;
         }
-        if (mDelivered < mInfo.frames && mInfo.frames != SF_COUNT_MAX) {
+        if (mLengthKnown && mDelivered < mInfo.frames && mInfo.frames != SF_COUNT_MAX) {
             *cause = "cannot decode: the file ends after " + std::to_string(mDelivered) + " of " +
                      std::to_string(mInfo.frames) + " samples";
             return -1;

@@ -8,6 +8,7 @@
 
 #include "routes/Pacer.h"
 #include "routes/RecordingReader.h"
+#include "routes/ResampledInput.h"
 #include "routes/RouteFactories.h"
 #include "routes/SoundFileInput.h"
 
@@ -17,6 +18,8 @@ namespace platform {
 namespace {
 
 constexpr long kDecodeBlock = 1024;
+// Every capture stream of the platform runs at it.
+constexpr uint32_t kMicrophoneRate = 44100;
 
 class WavCaptureRoute : public CaptureRoute {
 public:
@@ -65,8 +68,9 @@ public:
         std::lock_guard<std::mutex> lock(mStatusLock);
         mProgress.ended = mEnded && mHead == mPending.size();
         // Conversion may end a sample or two away from the exact length: the end is the total.
-        mProgress.seconds = mProgress.ended ? mProgress.totalSeconds
-                                            : std::min(static_cast<double>(mDelivered) / mRate, mProgress.totalSeconds);
+        const double played = static_cast<double>(mDelivered) / mRate;
+        const double total = mProgress.totalSeconds;  // 0: a stream of unknown length
+        mProgress.seconds = total <= 0 ? played : mProgress.ended ? total : std::min(played, total);
         return static_cast<ssize_t>(n);
     }
 
@@ -105,7 +109,7 @@ private:
 
 }  // namespace
 
-bool checkWavCapture(const std::string& path, std::string* reason) {
+bool checkRecording(const std::string& path, uint32_t rate, std::string* reason) {
     SoundFileInput input;
     std::vector<float> block(kDecodeBlock);
     std::string cause;
@@ -113,10 +117,16 @@ bool checkWavCapture(const std::string& path, std::string* reason) {
         if (reason) *reason = cause;
         return false;
     }
+    if (!ResampledInput::convertible(input.rate(), rate, &cause)) {
+        if (reason) *reason = cause;
+        return false;
+    }
     const sf_count_t got = input.readMono(block.data(), kDecodeBlock, &cause);
     if (got <= 0 && reason) *reason = got < 0 ? cause : "has no samples";
     return got > 0;
 }
+
+bool checkWavCapture(const std::string& path, std::string* reason) { return checkRecording(path, kMicrophoneRate, reason); }
 
 std::unique_ptr<CaptureRoute> makeWavCaptureRoute(const std::string& path, std::string* error) {
     auto input = std::make_unique<SoundFileInput>();

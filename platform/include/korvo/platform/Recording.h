@@ -13,17 +13,22 @@ namespace platform {
 
 class KORVO_PLATFORM_API Recording {
 public:
-    // Opens PATH ("-": standard input, read whole) for delivery at `rate`; null with the
-    // cause in a few words ("cannot open: No such file or directory").
+    // Opens PATH ("-": standard input, read as it comes) for delivery at `rate`, after the
+    // same checks as the wav route's; null with the cause in a few words ("cannot open:
+    // No such file or directory", "has no samples").
     static std::unique_ptr<Recording> open(const std::string& path, uint32_t rate, std::string* cause);
     virtual ~Recording();
 
     // Up to `count` samples into `out`: fewer only at the end, 0 after the last sample,
     // -1 with the cause when the file cannot be decoded further.
     virtual long read(int16_t* out, long count, std::string* cause) = 0;
-    // Length of the whole recording at its own rate.
+    // Length of the whole recording at its own rate; 0 when unknown (a stream).
     virtual double totalSeconds() const = 0;
 };
+
+// Ends every wait for the bytes of a stream (standard input, a FIFO): its recordings end
+// as if the writer had closed it. For Ctrl-C: safe to call in a signal handler.
+KORVO_PLATFORM_API void interruptRecordings();
 
 }  // namespace platform
 }  // namespace korvo
