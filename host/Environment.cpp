@@ -39,6 +39,17 @@ void applyLogSettings(int verbose) {
     korvo::platform::reloadLogConfig();
 }
 
+bool checkSettings(std::string* error) {
+    // The log's levels, as the platform reads them: a setting it would ignore is an error here.
+    const char* level = getenv("KORVO_LOG_LEVEL");
+    if (level != nullptr && *level != '\0' &&
+        !(level[1] == '\0' && std::string("VDIWEFvdiwef").find(level[0]) != std::string::npos)) {
+        *error = "KORVO_LOG_LEVEL: '" + std::string(level) + "' is not a log level (V, D, I, W, E or F)";
+        return false;
+    }
+    return true;
+}
+
 bool applyEnvironment(const CommonOptions& common, std::string* error) {
     if (!applyRoute("KORVO_MIC", common.mic, error)) return false;
     if (!applyRoute("KORVO_SPEAKER", common.speaker, error)) return false;

@@ -12,6 +12,9 @@ namespace host {
 // and checks the routes that the environment already names. False with a
 // one-line reason when a route text is not valid.
 bool applyEnvironment(const CommonOptions& common, std::string* error);
+// Whether the settings every command reads from the environment are usable (a log level
+// the platform knows); false with a one-line reason.
+bool checkSettings(std::string* error);
 // Only the platform log's part of it: stderr with -v, silent otherwise.
 void applyLogSettings(int verbose);
 

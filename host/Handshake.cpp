@@ -21,6 +21,7 @@
 #include "host/Clock.h"
 #include "host/CodePlan.h"
 #include "host/Hearing.h"
+#include "host/Interrupt.h"
 #include "host/JsonEvent.h"
 #include "host/Options.h"
 #include "host/Output.h"
@@ -191,6 +192,8 @@ private:
 };
 
 int runHandshake(const CommonOptions& common, const HandshakeOptions& o) {
+    // A device of the demo: the demo stops it with SIGTERM and says why itself.
+    if (o.startOnStdin) leaveInterruptionsToParent();
     const bool speaker = o.role == "speaker";
     const int limit = o.noAck ? kHandshakeCodes - 1 : kHandshakeCodes - 2;
     if (o.firstCode > limit) {

@@ -1,5 +1,6 @@
 #include "host/Options.h"
 
+#include <algorithm>
 #include <cmath>
 #include <cstdlib>
 #include <map>
@@ -41,6 +42,30 @@ CLI::Validator finiteRange(double lo, double hi) {
             return {};
         },
         "NUMBER in [" + number(lo) + " - " + number(hi) + "]", "finite range");
+}
+
+void readWholeNumbersAsDecimal(CLI::App& app) {
+    // "010" is ten, as a person means it, not eight; a sign and digits only ("0x10" is refused).
+    const CLI::Validator decimal(
+        [](std::string& text) -> std::string {
+            size_t at = text.size() > 1 && (text[0] == '-' || text[0] == '+') ? 1 : 0;
+            if (at == text.size() || text.find_first_not_of("0123456789", at) != std::string::npos) {
+                return "'" + text + "' is not a whole number";
+            }
+            const size_t first = std::min(text.find_first_not_of('0', at), text.size() - 1);
+            text = (text[0] == '-' ? "-" : "") + text.substr(first);
+            return {};
+        },
+        "", "decimal");
+    for (CLI::App* sub : app.get_subcommands([](CLI::App*) { return true; })) {
+        for (CLI::Option* option : sub->get_options([](CLI::Option*) { return true; })) {
+            // "INT" or "UINT", followed by its checks' descriptions ("INT:INT in [0 - 39]").
+            const std::string type = option->get_type_name();
+            const size_t end = type.find(':');
+            const std::string base = type.substr(0, end);
+            if (base == "INT" || base == "UINT") option->transform(decimal);  // runs before the other checks
+        }
+    }
 }
 
 void addLevelOption(CLI::App* sub, LevelChoice* level, const char* help, bool allowAuto) {

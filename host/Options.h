@@ -43,6 +43,9 @@ struct LevelChoice {
     int value = 0;
 };
 
+// Every whole-number option of every command reads its text as decimal; call once
+// the commands are added.
+void readWholeNumbersAsDecimal(CLI::App& app);
 // A number that is finite and within [lo, hi] ("nan", "inf" and the like are refused).
 CLI::Validator finiteRange(double lo, double hi);
 // --level L (and "auto" where `allowAuto`).

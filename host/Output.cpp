@@ -1,5 +1,6 @@
 #include "host/Output.h"
 
+#include "host/Interrupt.h"
 #include "host/JsonEvent.h"
 
 #include <fcntl.h>
@@ -16,6 +17,21 @@ namespace {
 FILE* gOut = nullptr;
 
 FILE* hostOut() { return gOut ? gOut : stdout; }
+
+// The first failed write of the host's own output (0: none): results that did not reach
+// their reader make the command fail.
+int gOutError = 0;
+
+void flushHostOut() {
+    FILE* out = hostOut();
+    if ((fflush(out) != 0 || ferror(out)) && gOutError == 0) gOutError = errno != 0 ? errno : EIO;
+    clearerr(out);
+}
+
+void writeErrLine(const std::string& line) {
+    fprintf(stderr, "soundmeter: %s\n", line.c_str());
+    fflush(stderr);
+}
 
 }  // namespace
 
@@ -36,17 +52,19 @@ void initHostOutput() {
 void outf(const char* fmt, ...) {
     va_list ap;
     va_start(ap, fmt);
+    errno = 0;
     vfprintf(hostOut(), fmt, ap);
     va_end(ap);
-    fflush(hostOut());
+    flushHostOut();
 }
 
 namespace {
 OutputMode gMode = OutputMode::Normal;
 
 void vprint(const char* fmt, va_list ap) {
+    errno = 0;
     vfprintf(hostOut(), fmt, ap);
-    fflush(hostOut());
+    flushHostOut();
 }
 }  // namespace
 
@@ -98,18 +116,39 @@ void moveHostOutputToStderr() {
 
 bool hostOutputIsTerminal() { return isatty(fileno(hostOut())) != 0; }
 
+std::string shown(const std::string& text) {
+    std::string out;
+    for (const char c : text) {
+        const auto u = static_cast<unsigned char>(c);
+        if (c == '\n' || c == '\r') {
+            out += ' ';  // one line, whatever the text carried
+        } else if (u < 0x20 || u == 0x7f) {
+            char escaped[8];
+            snprintf(escaped, sizeof escaped, "\\x%02x", u);
+            out += escaped;
+        } else {
+            out += c;
+        }
+    }
+    return out;
+}
+
 void errf(const char* fmt, ...) {
+    // After Ctrl-C the failures it causes are not news: "interrupted" is the one line.
+    if (interrupted()) return;
     char line[1024];
     va_list ap;
     va_start(ap, fmt);
     vsnprintf(line, sizeof line, fmt, ap);
     va_end(ap);
-    // One line, whatever the message carried.
-    for (char* p = line; *p; ++p) {
-        if (*p == '\n' || *p == '\r') *p = ' ';
-    }
-    fprintf(stderr, "soundmeter: %s\n", line);
-    fflush(stderr);
+    writeErrLine(shown(line));
+}
+
+void interruptionLine(const char* what) { writeErrLine(what); }
+
+int hostOutputError() {
+    flushHostOut();
+    return gOutError;
 }
 
 LibraryStdout::~LibraryStdout() { stop(); }

@@ -40,8 +40,15 @@ void moveHostOutputToStderr();
 // Whether the host's own standard output is a terminal (descriptor 1 may be a pipe
 // to the plug-in's line handler meanwhile).
 bool hostOutputIsTerminal();
-// One line on stderr, "soundmeter: " in front and a line end added.
+// One line on stderr, "soundmeter: " in front and a line end added; control characters
+// (of a file or route name the user gave) are shown escaped. Silent once Ctrl-C or
+// SIGTERM has come: interruptionLine() is then the one line.
 void errf(const char* fmt, ...) __attribute__((format(printf, 1, 2)));
+void interruptionLine(const char* what);
+// A text the user gave, fit to print: control characters escaped (\x1b), line ends as spaces.
+std::string shown(const std::string& text);
+// The first error of a write to the host's own standard output (0: every write went out).
+int hostOutputError();
 
 // Routes the process's standard output through a pipe to a line handler for as
 // long as it is started. The handler runs on a reader thread of its own.

@@ -24,7 +24,7 @@ int Session::open(const DeviceSettings& settings, LibraryStdout::LineHandler han
     if (!mPlugin.load(Plugin::choosePath(mCommon.plugin), &error)) {
         close();
         errf("%s", error.c_str());
-        return 1;
+        return 2;  // --plugin or KORVO_PLUGIN: a setting that cannot be used
     }
     mDevice = std::make_unique<Device>(mPlugin, mWatch);
     if (!mDevice->open(settings, &error)) {

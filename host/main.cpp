@@ -2,12 +2,14 @@
 // dlopen and drives it only through its factory, its interface and its destroy
 // function, as a product embedding the plug-in would.
 #include <csignal>
+#include <cstring>
 #include <string>
 #include <vector>
 
 #include <CLI/CLI.hpp>
 
 #include "host/CodePlan.h"
+#include "host/Environment.h"
 #include "host/Interrupt.h"
 #include "host/Options.h"
 #include "host/Output.h"
@@ -47,6 +49,7 @@ int main(int argc, char** argv) {
         addSpectrogramCommand(app, common),
     };
     for (Command& c : commands) addCommonFlags(c.app, common);
+    readWholeNumbersAsDecimal(app);
 
     try {
         app.parse(argc, argv);
@@ -70,16 +73,25 @@ int main(int argc, char** argv) {
         errf("-q and --json cannot be used together");
         return 2;
     }
+    std::string unusable;
+    if (!checkSettings(&unusable)) {
+        errf("%s", unusable.c_str());
+        return 2;
+    }
     setOutputMode(common.json ? OutputMode::Json : common.quiet ? OutputMode::Quiet : OutputMode::Normal);
     for (Command& c : commands) {
         if (!c.app->parsed()) continue;
         const int status = c.action();
-        // Ctrl-C ends every command the same way, with one line. SIGTERM comes from another
-        // process (the demo stopping its devices): that one knows, nothing to say.
-        if (interruptSignal() == SIGTERM) return 143;
+        // Ctrl-C and SIGTERM end every command the same way, with one line.
         if (interrupted()) {
-            errf("interrupted");
-            return 130;
+            const bool term = interruptSignal() == SIGTERM;
+            if (!interruptionsLeftToParent()) interruptionLine(term ? "terminated" : "interrupted");
+            return term ? 143 : 130;
+        }
+        // Results that never reached standard output are a failure, not a success.
+        if (const int error = hostOutputError()) {
+            errf("standard output: cannot write: %s", strerror(error));
+            return status == 0 ? 1 : status;
         }
         return status;
     }
