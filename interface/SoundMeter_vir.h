@@ -49,7 +49,9 @@ extern "C" {
 // Creates a meter object. Never null (an allocation failure is the allocator's).
 KORVO_EXPORT SoundMeter_vir* soundMeter_maker();
 // Destroys a meter object made by soundMeter_maker; null does nothing. Does not
-// release a tone generator that the host did not release.
+// release a tone generator that the host did not release. Ends the analysis thread,
+// which every meter object of the process shares: a host that keeps another meter
+// calls start_wf_thread() on it again.
 KORVO_EXPORT void soundMeter_destroy(SoundMeter_vir* meter);
 }
 
