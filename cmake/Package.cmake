@@ -19,9 +19,11 @@ install(TARGETS korvo_soundmeter korvo_platform LIBRARY DESTINATION ${KORVO_INST
 
 # A host writes #include <SoundMeter_vir.h>; the header's own "Export.h" and
 # <system/audio.h> resolve inside the same folder.
-# SoundMeterConstants.h: the numbers the library shares with its hosts (code plan, sizes).
+# SoundMeterConstants.h: the numbers the library shares with its hosts (code plan, sizes);
+# FrameRecord.h: the frame record a host reads with read_write_audio.
 install(FILES ${CMAKE_SOURCE_DIR}/interface/SoundMeter_vir.h ${CMAKE_SOURCE_DIR}/interface/Export.h
   ${CMAKE_SOURCE_DIR}/interface/SoundMeterConstants.h
+  ${CMAKE_SOURCE_DIR}/interface/FrameRecord.h
   DESTINATION ${KORVO_INSTALL_INCLUDEDIR})
 install(FILES ${CMAKE_SOURCE_DIR}/platform/include/system/audio.h
   DESTINATION ${KORVO_INSTALL_INCLUDEDIR}/system)

@@ -42,8 +42,9 @@ bool Plugin::load(const std::string& path, std::string* error) {
     }
     mMaker = reinterpret_cast<soundMeter_maker_t>(dlsym(mHandle, "soundMeter_maker"));
     mDestroy = reinterpret_cast<soundMeter_destroy_t>(dlsym(mHandle, "soundMeter_destroy"));
-    if (mMaker == nullptr || mDestroy == nullptr) {
-        if (error) *error = "the plug-in " + path + " exports no soundMeter_maker/soundMeter_destroy";
+    mReadRecord = reinterpret_cast<read_write_audio_t>(dlsym(mHandle, KORVO_READ_WRITE_AUDIO_SYMBOL));
+    if (mMaker == nullptr || mDestroy == nullptr || mReadRecord == nullptr) {
+        if (error) *error = "the plug-in " + path + " exports no soundMeter_maker/soundMeter_destroy/read_write_audio";
         unload();
         return false;
     }
@@ -55,6 +56,7 @@ void Plugin::unload() {
     mHandle = nullptr;
     mMaker = nullptr;
     mDestroy = nullptr;
+    mReadRecord = nullptr;
 }
 
 }  // namespace host

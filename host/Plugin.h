@@ -1,7 +1,9 @@
-// Loading the plug-in: dlopen, and the two exported functions looked up by name.
+// Loading the plug-in: dlopen, and the exported functions looked up by name: the
+// factory, the destroy function and the frame record's reader.
 #pragma once
 #include <string>
 
+#include "interface/FrameRecord.h"
 #include "interface/SoundMeter_vir.h"
 
 namespace korvo {
@@ -28,8 +30,12 @@ public:
         if (mDestroy) mDestroy(meter);
     }
 
+    // read_write_audio: copies the frame record the capture steps publish.
+    read_write_audio_t frameRecordReader() const { return mReadRecord; }
+
 private:
     void* mHandle = nullptr;
+    read_write_audio_t mReadRecord = nullptr;
     soundMeter_maker_t mMaker = nullptr;
     soundMeter_destroy_t mDestroy = nullptr;
 };

@@ -48,7 +48,7 @@ if ! cmake --install "$build" --prefix "$prefix" > "$work/install.log" 2>&1; the
 fi
 for file in lib/libkorvo_soundmeter.so lib/libkorvo_platform.so bin/soundmeter \
   include/korvo_soundmeter/SoundMeter_vir.h include/korvo_soundmeter/Export.h \
-  include/korvo_soundmeter/system/audio.h include/korvo_soundmeter/SoundMeterConstants.h \
+  include/korvo_soundmeter/system/audio.h include/korvo_soundmeter/SoundMeterConstants.h include/korvo_soundmeter/FrameRecord.h \
   lib/pkgconfig/korvo_soundmeter.pc \
   lib/cmake/korvo_soundmeter/korvo_soundmeterConfig.cmake \
   lib/cmake/korvo_soundmeter/korvo_soundmeterConfigVersion.cmake \
