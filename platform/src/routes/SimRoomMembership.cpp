@@ -136,7 +136,8 @@ void reclaimAbandonedRooms(const std::string& except) {
     DIR* dir = opendir(roomFolder().c_str());
     if (!dir) return;
     while (const dirent* entry = readdir(dir)) {
-        if (entry->d_name[0] == '.') continue;
+        // Room names may begin with a dot: skip only the folder's own entries.
+        if (std::strcmp(entry->d_name, ".") == 0 || std::strcmp(entry->d_name, "..") == 0) continue;
         const std::string path = roomFolder() + "/" + entry->d_name;
         if (path != except) reclaimIfAbandoned(path);
     }
