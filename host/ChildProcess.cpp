@@ -189,11 +189,13 @@ bool ChildProcess::wait(int timeoutMs, int* status) {
         pid_t r = waitpid(mPid, &raw, WNOHANG);
         if (r == mPid) {
             *status = WIFEXITED(raw) ? WEXITSTATUS(raw) : 128 + WTERMSIG(raw);
+            mEndSignal = WIFSIGNALED(raw) ? WTERMSIG(raw) : 0;
             mPid = -1;
             return true;
         }
         if (r < 0 && errno != EINTR) {
             mPid = -1;
+            mEndSignal = 0;
             *status = 127;
             return true;
         }

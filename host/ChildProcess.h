@@ -52,6 +52,8 @@ public:
     // Reaps the child within timeoutMs; true with its exit status (128 + signal when a
     // signal ended it).
     bool wait(int timeoutMs, int* status);
+    // The signal that ended the child reaped last, 0 when it exited.
+    int endSignal() const { return mEndSignal; }
     bool running() const { return mPid > 0; }
     pid_t pid() const { return mPid; }
 
@@ -61,6 +63,7 @@ private:
     int mStdin = -1;        // the write end of the child's stdin, when piped
     std::string mText[2];
     size_t mTaken = 0;  // stdout text already handed out as lines
+    int mEndSignal = 0;
 };
 
 // The path of this executable, for re-executing itself.

@@ -86,6 +86,7 @@ public:
             errf("speaker %s", why.c_str());
             return 2;
         }
+        if (!roomsFree()) return 2;
         mStart = monotonicMs();
         std::string noise = "no noise";
         if (mOpt.snrGiven) {
@@ -105,10 +106,36 @@ public:
         int status[2] = {-1, -1};
         finish(status);
         if (freshRoom) removeRoom();
+        if (mAborted) leaveNamedRooms();
         return summarize(started, status);
     }
 
 private:
+    // Speakers of another run in a room would mix their codes with this demo's, and both
+    // runs would fail rounds without knowing why. A monitor only listens: it is welcome.
+    bool roomsFree() {
+        return roomFree(mSpeaker, "speaker") && (mMic == mSpeaker || roomFree(mMic, "microphone"));
+    }
+
+    bool roomFree(const std::string& route, const char* what) {
+        std::vector<pid_t> devices;
+        for (const ChildProcess& child : mChild) {
+            if (child.running()) devices.push_back(child.pid());
+        }
+        std::string why;
+        const int speakers = korvo::platform::routeRoomSpeakers(route, devices, &why);
+        if (speakers < 0) {
+            errf("%s %s", what, why.c_str());
+            return false;
+        }
+        if (speakers > 0) {
+            errf("%s %s: the room is in use (%s already in it would mix their codes with this demo's)", what,
+                 route.c_str(), plural(speakers, "speaker").c_str());
+            return false;
+        }
+        return true;
+    }
+
     bool startDevice(Who who) {
         std::vector<std::string> args = {"soundmeter", "handshake", "--role", kWhoName[who],
                                          "--rounds", std::to_string(mOpt.rounds), "--tone-ms",
@@ -189,15 +216,23 @@ private:
                 if (!child.pump(0)) mOpen[who[i]] = false;
                 for (const std::string& line : child.takeLines()) onLine(static_cast<Who>(who[i]), line);
             }
-            // A device that ended without getting ready ends the demo.
+            // A device whose output ended before its last line ("done") died or gave up:
+            // the demo ends at once instead of waiting for its peer's rounds to time out.
             for (int w = 0; w < 2; ++w) {
-                if (!mOpen[w] && !mReady[w] && !mBegun) stopDevices();
+                if (!mOpen[w] && !mDone[w]) stopDevices();
             }
             if (mAborted) break;
         }
     }
 
     void begin() {
+        // A run started at the same moment passed the check at the start; its devices are
+        // in the room by now, as this demo's are: the later of the two is always told.
+        if (!roomsFree()) {
+            mCrowded = true;
+            stopDevices();
+            return;
+        }
         mBegun = true;
         for (int w = 0; w < 2; ++w) {
             mChild[w].writeLine("go");
@@ -247,6 +282,7 @@ private:
             show(t, who, "did not hear code " + std::to_string(code) + " (" + std::to_string(codeHz(code)) + " Hz) within " +
                              std::to_string(p.get("waited")) + " ms");
         } else if (p.event == "done") {
+            mDone[who] = true;
             show(t, who, "finished, " + std::to_string(p.get("completed")) + " of " + plural(p.get("rounds"), "round"));
         }
     }
@@ -288,6 +324,7 @@ private:
                 mChild[w].sendSignal(SIGKILL);
                 mChild[w].wait(5000, &status[w]);
             }
+            mSignal[w] = mChild[w].endSignal();
         }
     }
 
@@ -302,6 +339,17 @@ private:
         }
         probe.reset();
         infof("room %s removed\n", mRoom.c_str());
+    }
+
+    // Devices the demo stopped could not leave a named room. Joining and leaving once
+    // more forgets them, and removes the room unless someone else is in it (a monitor).
+    void leaveNamedRooms() {
+        std::vector<std::string> routes = {mMic};
+        if (mSpeaker != mMic) routes.push_back(mSpeaker);
+        for (const std::string& route : routes) {
+            // Joins and leaves at once.
+            if (route.compare(0, 4, "sim:") == 0 && route != "sim:" + mRoom) korvo::platform::makeCaptureRoute(route, nullptr);
+        }
     }
 
     int summarize(bool started, const int status[2]) {
@@ -322,12 +370,14 @@ private:
         }
         if (interrupted()) return 130;
         if (!started) return 1;
+        if (mCrowded) return 2;  // its line is out
         if (!mStuck.empty()) return 1;  // its line is out
         std::string failed;
         for (int w = 0; w < 2; ++w) {
             if (status[w] <= 0 || mKilled[w]) continue;  // 0: finished well; -1: never started
-            failed += std::string(failed.empty() ? "" : ", ") + "the " + kWhoName[w] + " ended with status " +
-                      std::to_string(status[w]);
+            failed += std::string(failed.empty() ? "" : ", ") + "the " + kWhoName[w] +
+                      (mSignal[w] ? " was killed by signal " + std::to_string(mSignal[w])
+                                  : " ended with status " + std::to_string(status[w]));
         }
         if (!failed.empty()) {
             errf("%s", failed.c_str());
@@ -353,8 +403,11 @@ private:
     int64_t mQuietUntil[2] = {0, 0};  // a device silent past this has stopped responding
     std::string mStuck;               // the device that stopped responding
     bool mAborted = false;
-    bool mBegun = false;
-    bool mKilled[2] = {false, false};  // stopped by the demo, its status not its own  // both were ready and told to begin
+    bool mBegun = false;               // both were ready and told to begin
+    bool mCrowded = false;             // another run's speakers came into the room
+    bool mKilled[2] = {false, false};  // stopped by the demo, its status not its own
+    bool mDone[2] = {false, false};    // said its last line
+    int mSignal[2] = {0, 0};           // the signal that ended it, 0 when it exited
     std::map<int, Round> mRounds;
     std::map<int, bool> mCounted;
     std::vector<long long> mLatencies;  // per completed exchange, from the speaker's code

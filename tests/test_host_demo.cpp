@@ -24,6 +24,12 @@ std::vector<std::string> in(const std::string& room, std::vector<std::string> ar
     return args;
 }
 
+// A device is the demo's child with its role on the command line.
+pid_t deviceOf(const HostProcess& demo, const std::string& role) {
+    const ProcessResult ps = runHost("/usr/bin/pgrep", {"-P", std::to_string(demo.pid()), "-f", "role " + role}, 5000);
+    return ps.status == 0 ? std::stoi(ps.out) : -1;
+}
+
 TEST(HostDemo, ExchangesWithAcknowledgementAsJsonEvents) {
     const std::string room = uniqueRoom("json");
     const ProcessResult r = runHost(kHost, in(room, {"--json", "demo"}), kRunMs);  // 3 rounds, tones of 300 ms
@@ -66,10 +72,7 @@ TEST(HostDemo, ADeviceThatStopsRespondingEndsTheDemo) {
     HostProcess demo(kHost);
     ASSERT_TRUE(demo.start({"demo", "--rounds", "20", "--timeout-ms", "1000", "--tone-ms", "300"}));
     ASSERT_TRUE(demo.waitForOutput("listener  hears", kReadyMs));
-    // The listener is the demo's child with its role on the command line.
-    const ProcessResult ps = runHost("/usr/bin/pgrep", {"-P", std::to_string(demo.pid()), "-f", "role listener"}, 5000);
-    ASSERT_EQ(ps.status, 0);
-    const pid_t listener = std::stoi(ps.out);
+    const pid_t listener = deviceOf(demo, "listener");
     ASSERT_EQ(kill(listener, SIGSTOP), 0);
     const auto stopped = std::chrono::steady_clock::now();
     const ProcessResult r = demo.finish(kRunMs);
@@ -81,6 +84,26 @@ TEST(HostDemo, ADeviceThatStopsRespondingEndsTheDemo) {
     std::smatch m;
     ASSERT_TRUE(std::regex_search(r.out, m, std::regex("demo in room ([a-z0-9-]+):")));
     EXPECT_FALSE(roomExists(m[1]));  // the demo removed what its killed device left
+}
+
+TEST(HostDemo, ASecondDemoInItsRoomIsRefusedAndAKilledDeviceEndsItAtOnce) {
+    const std::string room = uniqueRoom("shared");
+    HostProcess demo(kHost);
+    ASSERT_TRUE(demo.start(in(room, {"demo", "--rounds", "100"})));
+    ASSERT_TRUE(demo.waitForOutput("listener  hears", kReadyMs));
+    ProcessResult r = runHost(kHost, in(room, {"demo", "--no-ack"}), kRunMs);
+    EXPECT_EQ(r.status, 2);
+    EXPECT_EQ(r.out, "");
+    EXPECT_EQ(r.err, "soundmeter: speaker sim:" + room +
+                         ": the room is in use (2 speakers already in it would mix their codes with this demo's)\n");
+    // Its exit is known at once: far sooner than its peer's round timeout (8 s).
+    const pid_t listener = deviceOf(demo, "listener");
+    ASSERT_EQ(kill(listener, SIGKILL), 0);
+    r = demo.finish(4000);
+    EXPECT_FALSE(r.timedOut);
+    EXPECT_EQ(r.status, 1);
+    EXPECT_EQ(r.err, "soundmeter: the listener was killed by signal 9\n");
+    EXPECT_FALSE(roomExists(room));  // the demo left for the speaker it stopped
 }
 
 TEST(HostDemo, ARoomFolderHeldByAnotherUserIsAnUnusableRoute) {

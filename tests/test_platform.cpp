@@ -482,18 +482,21 @@ TEST_F(PlatformTest, RoomSpeakersAreMixedAndClippedTo16Bits) {
 
 TEST_F(PlatformTest, WhatDeadProcessesLeftIsReclaimedAndRoomsArePrivate) {
     const std::string room = uniqueRoom("crash"), stale = uniqueRoom("stale"), unborn = uniqueRoom("unborn"),
-                      alien = uniqueRoom("alien");
+                      alien = uniqueRoom("alien"), dotted = "." + uniqueRoom("dot");
     auto in = makeCaptureRoute("sim:" + room, nullptr);
     EXPECT_EQ(fs::status(roomFile(room)).permissions(), fs::perms::owner_read | fs::perms::owner_write);
     Child hog = device("speak", room, {{"KORVO_ROOM_PLACES", "16"}, {"KORVO_ROOM_VALUE", "3000"},
                                        {"KORVO_ROOM_MS", "20000"}, {"KORVO_ROOM_READY_MS", "100"}});
     Child member = device("listen", stale, {{"KORVO_ROOM_MS", "20000"}});
-    ASSERT_TRUE(hog.waitReady() && member.waitReady() && fs::exists(roomFile(stale)));
+    Child hidden = device("listen", dotted, {{"KORVO_ROOM_MS", "20000"}});
+    ASSERT_TRUE(hog.waitReady() && member.waitReady() && hidden.waitReady() && fs::exists(roomFile(stale)) &&
+                fs::exists(roomFile(dotted)));
     std::string error;
     EXPECT_EQ(makeOutputRoute("sim:" + room, &error), nullptr);
     EXPECT_NE(error.find("full"), std::string::npos) << error;
     hog.kill();  // in the middle of its writes
     member.kill();
+    hidden.kill();
     auto out = makeOutputRoute("sim:" + room, &error);
     ASSERT_TRUE(out && in->open(kRate) == 0 && out->open(kRate) == 0) << error;
     std::thread player([&] { play(*out, 1000, ms(200)); });
@@ -509,7 +512,7 @@ TEST_F(PlatformTest, WhatDeadProcessesLeftIsReclaimedAndRoomsArePrivate) {
     }
     EXPECT_EQ(makeCaptureRoute("sim:" + alien, &error), nullptr);  // joining reclaims abandoned rooms
     EXPECT_NE(error.find("incompatible"), std::string::npos) << error;
-    EXPECT_FALSE(fs::exists(roomFile(stale)) || fs::exists(roomFile(unborn)));
+    EXPECT_FALSE(fs::exists(roomFile(stale)) || fs::exists(roomFile(unborn)) || fs::exists(roomFile(dotted)));
     EXPECT_TRUE(fs::remove(roomFile(alien))) << "a room of another layout is left alone";
 }
 

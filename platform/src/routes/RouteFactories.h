@@ -2,6 +2,7 @@
 #pragma once
 #include <memory>
 #include <string>
+#include <vector>
 
 #include <korvo/platform/Routes.h>
 
@@ -26,6 +27,7 @@ bool checkRecording(const std::string& path, uint32_t rate, std::string* reason)
 bool checkWavOutput(const std::string& path, std::string* reason);
 bool checkSimRoute(const std::string& room, bool speaker, std::string* reason);
 bool checkCardRoute(const std::string& device, bool input, std::string* reason);
+int simRoomSpeakers(const std::string& room, const std::vector<pid_t>& ours, std::string* reason);
 
 }  // namespace platform
 }  // namespace korvo

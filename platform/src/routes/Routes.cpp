@@ -115,6 +115,16 @@ bool checkCaptureRoute(const std::string& route, std::string* reason) { return c
 
 bool checkOutputRoute(const std::string& route, std::string* reason) { return checkRoute(route, true, reason); }
 
+int routeRoomSpeakers(const std::string& route, const std::vector<pid_t>& ours, std::string* reason) {
+    RouteText t;
+    if (!parse(route, &t, reason)) return -1;
+    if (t.kind != RouteKind::Sim) return 0;
+    std::string cause;
+    const int speakers = simRoomSpeakers(t.arg, ours, &cause);
+    if (speakers < 0 && reason) *reason = route + ": " + cause;
+    return speakers;
+}
+
 bool validateRoute(const std::string& route, std::string* error) {
     RouteText t;
     if (!parse(route, &t, error)) return false;

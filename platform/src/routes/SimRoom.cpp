@@ -175,6 +175,10 @@ bool checkSimRoute(const std::string& room, bool speaker, std::string* reason) {
                                  reason);
 }
 
+int simRoomSpeakers(const std::string& room, const std::vector<pid_t>& ours, std::string* reason) {
+    return RoomMembership::speakers(room, ours, reason);
+}
+
 std::unique_ptr<CaptureRoute> makeSimCaptureRoute(const std::string& room, std::string* error) {
     if (!sim::validateRoomName(room, error)) return nullptr;
     const std::optional<sim::MicSettings> settings = sim::micSettingsFromEnv(error);

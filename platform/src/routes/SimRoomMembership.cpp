@@ -8,6 +8,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdint>
 #include <cstdio>
@@ -136,7 +137,8 @@ void reclaimAbandonedRooms(const std::string& except) {
     DIR* dir = opendir(roomFolder().c_str());
     if (!dir) return;
     while (const dirent* entry = readdir(dir)) {
-        if (entry->d_name[0] == '.') continue;
+        // Room names may begin with a dot: skip only the folder's own entries.
+        if (std::strcmp(entry->d_name, ".") == 0 || std::strcmp(entry->d_name, "..") == 0) continue;
         const std::string path = roomFolder() + "/" + entry->d_name;
         if (path != except) reclaimIfAbandoned(path);
     }
@@ -300,10 +302,19 @@ RoomMembership::~RoomMembership() {
 
 bool RoomMembership::stillThere() const { return stillNamed(mFd, mObjectName); }
 
-bool RoomMembership::check(const std::string& room, Role role, std::string* error) {
+namespace {
+
+struct Occupants {
+    int members = 0;
+    int speakers = 0;  // of processes other than `ours`
+    std::vector<pid_t> ours;
+};
+
+// Counts the live members of a room under its lock, without joining it; a room not
+// made yet is empty. False with a reason when the room cannot be read.
+bool countOccupants(const std::string& room, Occupants* out, std::string* error) {
     if (!validateRoomName(room, error) || !privateFolder(error, false)) return false;
-    const std::string path = roomPath(room);
-    const int fd = open(path.c_str(), O_RDWR | O_CLOEXEC | O_NOFOLLOW);
+    const int fd = open(roomPath(room).c_str(), O_RDWR | O_CLOEXEC | O_NOFOLLOW);
     if (fd < 0) {
         if (errno == ENOENT) return true;  // a new room: joining creates it
         if (error) *error = "cannot open sim room '" + room + "': " + errnoText(errno);
@@ -318,11 +329,11 @@ bool RoomMembership::check(const std::string& room, Role role, std::string* erro
             if (layout->header.magic.load(std::memory_order_acquire) != 0) why = "sim room '" + room + "' was made by an incompatible build";
         } else {
             forgetDeparted(*layout);
-            int members = 0, speakers = 0;
-            for (const auto& m : layout->header.members) members += m.load(std::memory_order_acquire) != 0;
-            for (const auto& slot : layout->slots) speakers += slot.owner.load(std::memory_order_acquire) != 0;
-            if (members >= kMaxMembers || (role == Role::Speaker && speakers >= kSpeakerSlots)) {
-                why = "sim room '" + room + "' is full";
+            for (const auto& m : layout->header.members) out->members += m.load(std::memory_order_acquire) != 0;
+            for (const auto& slot : layout->slots) {
+                const uint64_t owner = slot.owner.load(std::memory_order_acquire);
+                const pid_t pid = pid_t(owner >> 32);
+                out->speakers += owner != 0 && std::find(out->ours.begin(), out->ours.end(), pid) == out->ours.end();
             }
         }
         unmapLayout(layout);
@@ -332,6 +343,24 @@ bool RoomMembership::check(const std::string& room, Role role, std::string* erro
     close(fd);
     if (!why.empty() && error) *error = why;
     return why.empty();
+}
+
+}  // namespace
+
+bool RoomMembership::check(const std::string& room, Role role, std::string* error) {
+    Occupants o;
+    if (!countOccupants(room, &o, error)) return false;
+    if (o.members >= kMaxMembers || (role == Role::Speaker && o.speakers >= kSpeakerSlots)) {
+        if (error) *error = "sim room '" + room + "' is full";
+        return false;
+    }
+    return true;
+}
+
+int RoomMembership::speakers(const std::string& room, const std::vector<pid_t>& ours, std::string* error) {
+    Occupants o;
+    o.ours = ours;
+    return countOccupants(room, &o, error) ? o.speakers : -1;
 }
 
 }  // namespace sim

@@ -11,9 +11,12 @@
 // last room. Joining also removes rooms of this user that every member has left or
 // died in. Audio itself never takes the lock (see SimRoomSlot.h).
 #pragma once
+#include <sys/types.h>
+
 #include <cstdint>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "routes/SimRoomLayout.h"
 
@@ -31,6 +34,9 @@ public:
     ~RoomMembership();  // leaves the room
     // Whether the room could be joined now, without joining it or leaving anything behind.
     static bool check(const std::string& room, Role role, std::string* error);
+    // The speakers that processes other than `ours` hold in the room now (0 when it is
+    // not there); -1 with a reason when it cannot be read.
+    static int speakers(const std::string& room, const std::vector<pid_t>& ours, std::string* error);
     // False once the room's file has been removed or replaced under this member.
     bool stillThere() const;
 

@@ -86,6 +86,11 @@ KORVO_PLATFORM_API bool validateRoute(const std::string& route, std::string* err
 // sentence naming the route and the cause.
 KORVO_PLATFORM_API bool checkCaptureRoute(const std::string& route, std::string* reason);
 KORVO_PLATFORM_API bool checkOutputRoute(const std::string& route, std::string* reason);
+// The loudspeakers that processes other than `ours` hold now in the simulated room a
+// ROUTE names: 0 for a room nobody is in, and for routes that are not rooms. -1 with a
+// reason naming the route when the room cannot be read.
+KORVO_PLATFORM_API int routeRoomSpeakers(const std::string& route, const std::vector<pid_t>& ours,
+                                         std::string* reason);
 
 // The state of this process's microphone or speaker stream: the route it uses and
 // whether that route has failed (one sentence naming the route and the cause).
