@@ -121,12 +121,15 @@ TEST_F(HostEdges, UnusableRecordingsAreRefusedAtTheCheckByEveryCommand) {
     sox("-n -r 100 -b 16 slow.wav synth 3 sine 20");
     sox("-n -r 44100 tone.flac synth 1 sine 2580");
     sox("-n -r 44100 -c 2 short.ogg synth 0.3 sine 2580");
+    sox("-n -r 44100 head.ogg synth 1 sine 2580");
+    fs::resize_file(path("head.ogg"), 100);  // its decoder's setup cut off
     fs::resize_file(path("tone.flac"), 43);
     fs::resize_file(path("short.ogg"), fs::file_size(path("short.ogg")) - 7);
     const std::pair<std::string, std::string> files[] = {
         {"slow.wav", "cannot convert the rate: 100 Hz is outside 173..11289600 Hz"},
         {"tone.flac", "cannot decode: "},
         {"short.ogg", "has no samples"},
+        {"head.ogg", "cannot decode: "},
     };
     for (const auto& [file, cause] : files) {
         const std::pair<std::string, std::string> commands[] = {
