@@ -11,7 +11,11 @@ namespace {
 const std::string kRaw = " -t raw -e signed-integer -b 16 -c 1 -r 44100 ";
 }
 
-std::string quote(const std::string& s) { return "'" + s + "'"; }
+std::string quote(const std::string& s) {
+    std::string q = "'";
+    for (char c : s) q += c == '\'' ? std::string("'\\''") : std::string(1, c);
+    return q + "'";
+}
 
 Samples readCommand(const std::string& command) {
     FILE* pipe = popen(command.c_str(), "r");

@@ -176,7 +176,12 @@ void falseCodes(FrameDecoder& d, double minutes, const std::string& dir) {
     std::printf("%-10s %10s %12s %s\n", "source", "events", "per hour", "codes");
     std::string speech, music;
     for (const std::string& f : files("/usr/share/sounds/alsa/*.wav")) if (f.find("Noise") == std::string::npos) speech += " " + quote(f);
-    for (const std::string& f : files("/usr/share/sounds/lomiri/ringtones/*.ogg")) music += " " + quote(f);
+    // The ringtones differ in rate and channels: each is converted before they are joined.
+    int n = 0;
+    for (const std::string& f : files("/usr/share/sounds/lomiri/ringtones/*.ogg")) {
+        const std::string wav = dir + "/music" + std::to_string(n++) + ".wav";
+        if (std::system(("sox -V1 " + quote(f) + " -r 44100 -c 1 " + wav).c_str()) == 0) music += " " + wav;
+    }
     const std::string voices = babble(dir);
     struct Source { std::string name, inputs, effects; };
     const std::vector<Source> sources = {
@@ -283,7 +288,7 @@ void reverb(FrameDecoder& d, const std::string& dir) {
             // An event counts for the tone it falls in (or the echo right after it).
             const int64_t slot = std::clamp<int64_t>((events[i].endSample - ms(300)) / step, 0, kCodes - 1);
             if (events[i].code == codes[static_cast<size_t>(slot)]) ++count[static_cast<size_t>(events[i].code)];
-            else ++wrong;
+            else ++wrong, std::printf("  wrong: code %d at %.3f s in slot of %d\n", events[i].code, events[i].endSample / kRate, codes[static_cast<size_t>(slot)]);
         }
         int missed = 0, twice = 0;
         for (int c : count) missed += c == 0, twice += c > 1;

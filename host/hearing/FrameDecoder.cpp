@@ -12,8 +12,6 @@ namespace host {
 namespace {
 
 constexpr double kRate = korvo::kSampleRate;
-constexpr int kCount = SpectrumWindow::kReferenceCount;
-constexpr int kRank = SpectrumWindow::kReferenceRank;
 constexpr int kGap = SpectrumWindow::kReferenceGap;
 
 // The code whose nominal frequency is nearest `hz` in ratio, and how far off it is.
@@ -35,7 +33,9 @@ int nearestCode(double hz, double* off) {
 
 FrameDecoder::FrameDecoder() : mHistory(static_cast<size_t>(kHistory), 0.0f) {
     for (int w = 0; w < kWindows; ++w) {
-        mWindows.push_back(std::make_unique<SpectrumWindow>(kWindowLengths[static_cast<size_t>(w)]));
+        mWindows.push_back(std::make_unique<SpectrumWindow>(kWindowLengths[static_cast<size_t>(w)], w == 0 ? kShortReferences : kReferences));
+        const int count = mWindows.back()->referenceCount();
+        const int rank = SpectrumWindow::rankOf(count);
         const double binHz = mWindows.back()->binHz();
         for (int c = 0; c < kCodes; ++c) {
             Range& r = mRanges[static_cast<size_t>(w)][static_cast<size_t>(c)];
@@ -46,11 +46,11 @@ FrameDecoder::FrameDecoder() : mHistory(static_cast<size_t>(kHistory), 0.0f) {
             // independent, which overcounts neighbours under Hann: the true rate is lower),
             // so each window's share of the code's 1e-9 is split among its bins.
             const int bins = r.hi - r.lo + 1;
-            r.start = orderStatisticThreshold(kCount, kRank, kFalseAlarm / kWindows / bins);
-            r.hold = orderStatisticThreshold(kCount, kRank, kHoldFalseAlarm / bins);
+            r.start = orderStatisticThreshold(count, rank, kFalseAlarm / kWindows / bins);
+            r.hold = orderStatisticThreshold(count, rank, kHoldFalseAlarm / bins);
         }
     }
-    mLineFactor = orderStatisticThreshold(kCount, kRank, kHoldFalseAlarm);
+    mLineFactor = orderStatisticThreshold(kShortReferences, SpectrumWindow::rankOf(kShortReferences), kHoldFalseAlarm);
 }
 
 FrameDecoder::~FrameDecoder() = default;
@@ -103,16 +103,27 @@ FrameDecoder::Peak FrameDecoder::find(int window, int code) const {
 // once are told apart only when the upper code arrives at least as loud as the lower.
 bool FrameDecoder::harmonicOfStronger(const SpectrumWindow& w, const Peak& p) const {
     const double nyquist = kRate / 2.0;
-    for (int k = 2; k <= kMaxHarmonic; ++k) {
-        for (int m = 0; m <= k; ++m) {
+    const int highest = static_cast<int>(p.hz / kLowestFundamentalHz);
+    for (int k = 2; k <= highest; ++k) {
+        // Folded harmonics only from the first kMaxFoldedHarmonic: higher ones are weak.
+        const int folds = k <= kMaxFoldedHarmonic ? k : 0;
+        for (int m = 0; m <= folds; ++m) {
             for (int sign : {1, -1}) {
                 if (m == 0 && sign < 0) continue;
                 const double f0 = (m * kRate + sign * p.hz) / k;
-                if (f0 < 2.0 * w.binHz() || f0 > nyquist - 2.0 * w.binHz()) continue;
+                if (f0 < kLowestFundamentalHz || f0 > nyquist - 2.0 * w.binHz()) continue;
                 if (std::fabs(f0 - p.hz) < 2.0 * w.binHz()) continue;
                 const int centre = static_cast<int>(std::lround(f0 / w.binHz()));
                 const int b = w.peak(centre - 1, centre + 1);
                 if (b < 0 || w.power(b) < w.power(p.bin)) continue;
+                // Beyond the first harmonics a bin's width at f0 covers many multiples: the
+                // line's own frequency, times k, must land on the peak, within the
+                // interpolation's error (a few Hz) k times.
+                if (k > kMaxFoldedHarmonic) {
+                    double hz = 0.0, power = 0.0;
+                    w.interpolate(b, &hz, &power);
+                    if (std::fabs(k * hz - p.hz) > std::max(0.15 * w.binHz(), 3.0) * (k + 1)) continue;
+                }
                 if (w.power(b) >= mLineFactor * w.noise(b, kGap)) return true;
             }
         }
@@ -122,6 +133,11 @@ bool FrameDecoder::harmonicOfStronger(const SpectrumWindow& w, const Peak& p) co
 
 bool FrameDecoder::pureLine(const SpectrumWindow&, const Peak&) const { return true; }
 
+double FrameDecoder::returnLevel(const Track& t) {
+    const double seconds = static_cast<double>(t.sinceEnd * korvo::kFrameSamples) / kRate;
+    return kReturnFactor * t.endLevel * std::pow(10.0, -6.0 * seconds / kMaxReverbSeconds);
+}
+
 bool FrameDecoder::begins(int code, Track& t) {
     for (int w = 0; w < kWindows; ++w) {
         const SpectrumWindow& win = *mWindows[static_cast<size_t>(w)];
@@ -130,7 +146,7 @@ bool FrameDecoder::begins(int code, Track& t) {
         if (t.sinceEnd >= 0 && win.length() > t.sinceEnd * korvo::kFrameSamples) break;
         const Peak p = find(w, code);
         if (p.bin < 0 || p.ratio < mRanges[static_cast<size_t>(w)][static_cast<size_t>(code)].start) continue;
-        if (t.sinceEnd >= 0 && t.sinceEnd < kRefractoryFrames && p.power < kReturnFactor * t.endLevel) continue;
+        if (t.sinceEnd >= 0 && p.power < returnLevel(t)) continue;
         if (harmonicOfStronger(win, p) || !pureLine(win, p)) continue;
         t.sounding = true;
         t.holdWindows = std::max(w + 1, 2);

@@ -9,13 +9,13 @@
 // with the noise around it (an order statistic of nearby bins, the louder side of two,
 // see SpectrumWindow); the threshold is the factor that noise alone passes with chance
 // 1e-9 per code and frame, shared among the windows and the range's bins. A peak is a
-// code only when it lies nearest that code's frequency, is no harmonic (2x .. 16x, folded
-// back at half the rate too) of a stronger line sounding with it, and stands as a pure
+// code only when it lies nearest that code's frequency, is no harmonic (of a line down to 150 Hz, the
+// first 25 folded back at half the rate too) of a stronger line sounding with it, and stands as a pure
 // line above the spectrum around it (talk-off).
 //
 // A code is reported once when it begins and stays sounding while its line holds; after
 // it ends, evidence for the same code may only come from samples after the end, and
-// within a second it must come back clearly louder than it ended (a reverberant tail
+// it must come back clearly louder than its echo would be by then (a reverberant tail
 // fades, it does not return).
 //
 // Real time: addFrame neither allocates nor blocks nor makes system calls; all memory is
@@ -39,16 +39,26 @@ public:
     static constexpr int kCodes = kHostCodes;  // 0..22: code 23 lies above half the rate
     // Lengths of the analysis windows, shortest first: one frame for speed, up to about
     // 280 ms so a 300 ms tone still fills the longest one.
-    static constexpr int kWindows = 7;
-    static constexpr std::array<int, kWindows> kWindowLengths = {512, 1024, 2048, 4096, 6144, 8192, 12288};
+    // Lengths between 40 ms and 64 ms let such short tones fill a window on most frame
+    // alignments.
+    static constexpr int kWindows = 9;
+    static constexpr std::array<int, kWindows> kWindowLengths = {512, 1024, 1536, 2048, 3072, 4096, 6144, 8192, 12288};
+    // Reference bins on each side: the one-frame window keeps 8 (within 1.4 kHz, so a
+    // sloped spectrum is judged locally; a loud tone passes its higher threshold anyway),
+    // the others 32 (a lower threshold, within 2.8 kHz at 1024 and narrower beyond).
+    static constexpr int kShortReferences = 8;
+    static constexpr int kReferences = 32;
     static constexpr int kHistory = 12288;
     static constexpr double kTolerance = 0.025;   // search range: 2 % clock error and a margin
     static constexpr double kFalseAlarm = 1e-9;   // per code and frame, in noise alone
     static constexpr double kHoldFalseAlarm = 1e-3;  // a sounding code holds at this weaker evidence
-    static constexpr int kMaxHarmonic = 16;       // clipping's odd harmonics stay strong this far
-    static constexpr int kReleaseFrames = 2;      // frames without the line that end a sounding
-    static constexpr int kRefractoryFrames = 86;  // a second after an end, a return must be louder
-    static constexpr double kReturnFactor = 4.0;  // by 6 dB in power
+    static constexpr double kLowestFundamentalHz = 150.0;  // voices and notes lie above
+    static constexpr int kMaxFoldedHarmonic = 25;  // clipping folds its 17th harmonic of code 17 onto code 16
+    static constexpr int kReleaseFrames = 4;      // frames without the line that end a sounding: an echo beats and dips
+    // An echo fades by 60 dB in at most this long (a large hall); a return of the same code
+    // must stand kReturnFactor above where such a fade would have left the ended sounding.
+    static constexpr double kMaxReverbSeconds = 3.0;
+    static constexpr double kReturnFactor = 10.0;  // 10 dB in power: an echo regrows after its dips by less
 
     FrameDecoder();
     ~FrameDecoder();
@@ -94,6 +104,7 @@ private:
     Peak find(int window, int code) const;
     bool harmonicOfStronger(const SpectrumWindow& w, const Peak& p) const;
     bool pureLine(const SpectrumWindow& w, const Peak& p) const;
+    static double returnLevel(const Track& t);
     bool begins(int code, Track& t);
     void holdOrEnd(int code, Track& t);
 

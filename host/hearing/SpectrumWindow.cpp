@@ -18,8 +18,8 @@ constexpr double kPi = 3.14159265358979323846;
 std::mutex gPlanner;
 }  // namespace
 
-SpectrumWindow::SpectrumWindow(int length)
-    : mLength(length), mBinHz(static_cast<double>(korvo::kSampleRate) / length),
+SpectrumWindow::SpectrumWindow(int length, int referenceCount)
+    : mLength(length), mCount(std::min(referenceCount, kMaxReferenceCount)), mBinHz(static_cast<double>(korvo::kSampleRate) / length),
       mWindow(static_cast<size_t>(length)), mPower(static_cast<size_t>(length / 2 + 1), 0.0f) {
     // A Hann window's coherent gain is 1/2: a sine of amplitude A reads |X| = A N / 4.
     const double scale = 4.0 / length;
@@ -47,18 +47,19 @@ void SpectrumWindow::analyse(const float* samples) {
 }
 
 bool SpectrumWindow::referenceBelow(int bin, int gap) const {
-    return bin - gap - kReferenceStep * (kReferenceCount - 1) >= 1;
+    return bin - gap - kReferenceStep * (mCount - 1) >= 1;
 }
 
 bool SpectrumWindow::referenceAbove(int bin, int gap) const {
-    return bin + gap + kReferenceStep * (kReferenceCount - 1) <= bins() - 2;
+    return bin + gap + kReferenceStep * (mCount - 1) <= bins() - 2;
 }
 
 double SpectrumWindow::side(int from, int step) const {
-    std::array<float, kReferenceCount> v{};
-    for (int i = 0; i < kReferenceCount; ++i) v[static_cast<size_t>(i)] = power(from + step * i);
-    std::nth_element(v.begin(), v.begin() + (kReferenceRank - 1), v.end());
-    return v[kReferenceRank - 1];
+    std::array<float, kMaxReferenceCount> v{};
+    for (int i = 0; i < mCount; ++i) v[static_cast<size_t>(i)] = power(from + step * i);
+    const int rank = rankOf(mCount);
+    std::nth_element(v.begin(), v.begin() + (rank - 1), v.begin() + mCount);
+    return v[static_cast<size_t>(rank - 1)];
 }
 
 double SpectrumWindow::noise(int bin, int gap) const {

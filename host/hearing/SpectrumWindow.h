@@ -12,15 +12,16 @@ namespace host {
 
 class SpectrumWindow {
 public:
-    // Reference bins for a noise estimate: kReferenceCount on each side, every
-    // kReferenceStep bins (bins two apart under Hann are nearly independent), the
-    // nearest kReferenceGap bins away (outside the main lobe of a line at the bin).
-    static constexpr int kReferenceCount = 8;
-    static constexpr int kReferenceRank = 6;  // of 8: two bins may hold other lines
+    // Reference bins for a noise estimate: `count` on each side, every kReferenceStep bins
+    // (bins two apart under Hann are nearly independent, neighbours are not), the nearest
+    // kReferenceGap bins away (outside the main lobe of a line at the bin); the estimate is
+    // the rank-th smallest, rank = 3/4 of count, so a quarter may hold other lines.
+    static constexpr int kMaxReferenceCount = 32;
     static constexpr int kReferenceStep = 2;
     static constexpr int kReferenceGap = 3;
+    static constexpr int rankOf(int count) { return count * 3 / 4; }
 
-    explicit SpectrumWindow(int length);
+    SpectrumWindow(int length, int referenceCount);
     ~SpectrumWindow();
     SpectrumWindow(const SpectrumWindow&) = delete;
     SpectrumWindow& operator=(const SpectrumWindow&) = delete;
@@ -29,6 +30,7 @@ public:
     void analyse(const float* samples);
 
     int length() const { return mLength; }
+    int referenceCount() const { return mCount; }
     int bins() const { return mLength / 2 + 1; }
     double binHz() const { return mBinHz; }
     float power(int bin) const { return mPower[static_cast<size_t>(bin)]; }
@@ -52,6 +54,7 @@ private:
     double side(int from, int step) const;
 
     int mLength;
+    int mCount;
     double mBinHz;
     float* mIn = nullptr;
     void* mOut = nullptr;  // fftwf_complex[bins]
