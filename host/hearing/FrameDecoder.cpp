@@ -119,10 +119,11 @@ bool FrameDecoder::harmonicOfStronger(const SpectrumWindow& w, const Peak& p) co
                 // Beyond the first harmonics a bin's width at f0 covers many multiples: the
                 // line's own frequency, times k, must land on the peak, within the
                 // interpolation's error (a few Hz) k times.
-                if (k > kMaxFoldedHarmonic) {
+                if (k > kLooseHarmonic) {
                     double hz = 0.0, power = 0.0;
                     w.interpolate(b, &hz, &power);
-                    if (std::fabs(k * hz - p.hz) > std::max(0.15 * w.binHz(), 3.0) * (k + 1)) continue;
+                    const double folded = std::fabs(std::remainder(k * hz, kRate));
+                    if (std::fabs(folded - p.hz) > std::max(0.15 * w.binHz(), 3.0) * (k + 1)) continue;
                 }
                 if (w.power(b) >= mLineFactor * w.noise(b, kGap)) return true;
             }

@@ -9,8 +9,8 @@
 // with the noise around it (an order statistic of nearby bins, the louder side of two,
 // see SpectrumWindow); the threshold is the factor that noise alone passes with chance
 // 1e-9 per code and frame, shared among the windows and the range's bins. A peak is a
-// code only when it lies nearest that code's frequency, is no harmonic (of a line down to 150 Hz, the
-// first 25 folded back at half the rate too) of a stronger line sounding with it, and stands as a pure
+// code only when it lies nearest that code's frequency, is no harmonic (of a line down to 80 Hz, the
+// first 40 folded back at half the rate too) of a stronger line sounding with it, and stands as a pure
 // line above the spectrum around it (talk-off).
 //
 // A code is reported once when it begins and stays sounding while its line holds; after
@@ -52,8 +52,12 @@ public:
     static constexpr double kTolerance = 0.025;   // search range: 2 % clock error and a margin
     static constexpr double kFalseAlarm = 1e-9;   // per code and frame, in noise alone
     static constexpr double kHoldFalseAlarm = 1e-3;  // a sounding code holds at this weaker evidence
-    static constexpr double kLowestFundamentalHz = 150.0;  // voices and notes lie above
-    static constexpr int kMaxFoldedHarmonic = 25;  // clipping folds its 17th harmonic of code 17 onto code 16
+    static constexpr double kLowestFundamentalHz = 80.0;  // a low voice lies above
+    // Clipping without noise keeps folded harmonics up to the 30th above the floor (code
+    // 3's 28th folds onto code 11). Up to the 16th a line's bin is matched, beyond only
+    // its interpolated frequency, else any stronger code would hide every weaker one.
+    static constexpr int kMaxFoldedHarmonic = 40;
+    static constexpr int kLooseHarmonic = 16;
     static constexpr int kReleaseFrames = 4;      // frames without the line that end a sounding: an echo beats and dips
     // An echo fades by 60 dB in at most this long (a large hall); a return of the same code
     // must stand kReturnFactor above where such a fade would have left the ended sounding.
