@@ -16,6 +16,9 @@ packages=(
   help2man man-db
   # the recording tests make their files with sox; its base formats hold FLAC and Ogg
   sox libsox-fmt-base
+  # the frame decoder's test and benchmark speak with espeak-ng; its benchmark plays
+  # recorded speech (alsa-utils) and music (lomiri-sounds' ringtones)
+  espeak-ng alsa-utils lomiri-sounds
   # The card test runs a private sound server that the card route reaches through
   # ALSA's pulse plug-in.
   pulseaudio libasound2-plugins

@@ -1,0 +1,204 @@
+#include "host/hearing/FrameDecoder.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstring>
+
+#include "host/hearing/OrderStatisticThreshold.h"
+
+namespace korvo {
+namespace host {
+
+namespace {
+
+constexpr double kRate = korvo::kSampleRate;
+constexpr int kGap = SpectrumWindow::kReferenceGap;
+
+// The code whose nominal frequency is nearest `hz` in ratio, and how far off it is.
+int nearestCode(double hz, double* off) {
+    int best = 0;
+    double bestOff = 1e9;
+    for (int c = 0; c < FrameDecoder::kCodes; ++c) {
+        const double o = std::fabs(std::log(hz / korvo::codeHz(c)));
+        if (o < bestOff) {
+            bestOff = o;
+            best = c;
+        }
+    }
+    *off = std::expm1(bestOff);
+    return best;
+}
+
+}  // namespace
+
+FrameDecoder::FrameDecoder() : mHistory(static_cast<size_t>(kHistory), 0.0f) {
+    for (int w = 0; w < kWindows; ++w) {
+        mWindows.push_back(std::make_unique<SpectrumWindow>(kWindowLengths[static_cast<size_t>(w)], w == 0 ? kShortReferences : kReferences));
+        const int count = mWindows.back()->referenceCount();
+        const int rank = SpectrumWindow::rankOf(count);
+        const double binHz = mWindows.back()->binHz();
+        for (int c = 0; c < kCodes; ++c) {
+            Range& r = mRanges[static_cast<size_t>(w)][static_cast<size_t>(c)];
+            r.lo = static_cast<int>(std::floor(korvo::codeHz(c) * (1.0 - kTolerance) / binHz));
+            r.hi = std::min(static_cast<int>(std::ceil(korvo::codeHz(c) * (1.0 + kTolerance) / binHz)),
+                            mWindows.back()->bins() - 2);
+            // Noise alone passes a bin of the range with chance p(t) (every bin counted as
+            // independent, which overcounts neighbours under Hann: the true rate is lower),
+            // so each window's share of the code's 1e-9 is split among its bins.
+            const int bins = r.hi - r.lo + 1;
+            r.start = orderStatisticThreshold(count, rank, kFalseAlarm / kWindows / bins);
+            r.hold = orderStatisticThreshold(count, rank, kHoldFalseAlarm / bins);
+        }
+    }
+    mLineFactor = orderStatisticThreshold(kShortReferences, SpectrumWindow::rankOf(kShortReferences), kHoldFalseAlarm);
+}
+
+FrameDecoder::~FrameDecoder() = default;
+
+int FrameDecoder::searchBins(int window, int code) const {
+    const Range& r = mRanges[static_cast<size_t>(window)][static_cast<size_t>(code)];
+    return r.hi - r.lo + 1;
+}
+
+double FrameDecoder::threshold(int window, int code) const {
+    return mRanges[static_cast<size_t>(window)][static_cast<size_t>(code)].start;
+}
+
+void FrameDecoder::reset() {
+    std::fill(mHistory.begin(), mHistory.end(), 0.0f);
+    mFrames = 0;
+    for (Track& t : mTracks) t = Track{};
+    mSounding = 0;
+}
+
+void FrameDecoder::levels(float* out256) const {
+    const SpectrumWindow& w = *mWindows.front();
+    for (int b = 0; b < korvo::kSpectrumBins; ++b) {
+        const double p = std::max(static_cast<double>(w.power(b)), 1e-30);
+        out256[b] = static_cast<float>(std::max(0.0, 100.0 * (1.0 + std::log10(p) / 12.0)));
+    }
+}
+
+FrameDecoder::Peak FrameDecoder::find(int window, int code) const {
+    const SpectrumWindow& w = *mWindows[static_cast<size_t>(window)];
+    const Range& r = mRanges[static_cast<size_t>(window)][static_cast<size_t>(code)];
+    Peak p;
+    p.bin = w.peak(r.lo, r.hi);
+    if (p.bin < 0) return p;
+    w.interpolate(p.bin, &p.hz, &p.power);
+    double off = 0.0;
+    // A peak nearer another code's frequency is that code's (codes 21 and 22 share bins).
+    if (nearestCode(p.hz, &off) != code || off > kTolerance) {
+        p.bin = -1;
+        return p;
+    }
+    p.ratio = w.power(p.bin) / w.noise(p.bin, kGap);
+    return p;
+}
+
+// A loudspeaker's distortion or clipping puts harmonics k f0 of a tone f0 (folded back
+// at half the rate: the capture's converter sees them after the distortion) where other
+// codes lie: code c's 2nd harmonic is code 2c+3 exactly. A peak that some stronger line
+// would put there is taken for that line's harmonic. So two devices saying c and 2c+3 at
+// once are told apart only when the upper code arrives at least as loud as the lower.
+bool FrameDecoder::harmonicOfStronger(const SpectrumWindow& w, const Peak& p) const {
+    const double nyquist = kRate / 2.0;
+    const int highest = static_cast<int>(p.hz / kLowestFundamentalHz);
+    for (int k = 2; k <= highest; ++k) {
+        // Folded harmonics only from the first kMaxFoldedHarmonic: higher ones are weak.
+        const int folds = k <= kMaxFoldedHarmonic ? k : 0;
+        for (int m = 0; m <= folds; ++m) {
+            for (int sign : {1, -1}) {
+                if (m == 0 && sign < 0) continue;
+                const double f0 = (m * kRate + sign * p.hz) / k;
+                if (f0 < kLowestFundamentalHz || f0 > nyquist - 2.0 * w.binHz()) continue;
+                if (std::fabs(f0 - p.hz) < 2.0 * w.binHz()) continue;
+                const int centre = static_cast<int>(std::lround(f0 / w.binHz()));
+                const int b = w.peak(centre - 1, centre + 1);
+                if (b < 0 || w.power(b) < w.power(p.bin)) continue;
+                // Beyond the first harmonics a bin's width at f0 covers many multiples: the
+                // line's own frequency, times k, must land on the peak, within the
+                // interpolation's error (a few Hz) k times.
+                if (k > kLooseHarmonic) {
+                    double hz = 0.0, power = 0.0;
+                    w.interpolate(b, &hz, &power);
+                    const double folded = std::fabs(std::remainder(k * hz, kRate));
+                    if (std::fabs(folded - p.hz) > std::max(0.15 * w.binHz(), 3.0) * (k + 1)) continue;
+                }
+                if (w.power(b) >= mLineFactor * w.noise(b, kGap)) return true;
+            }
+        }
+    }
+    return false;
+}
+
+bool FrameDecoder::pureLine(const SpectrumWindow&, const Peak&) const { return true; }
+
+double FrameDecoder::returnLevel(const Track& t) {
+    const double seconds = static_cast<double>(t.sinceEnd * korvo::kFrameSamples) / kRate;
+    return kReturnFactor * t.endLevel * std::pow(10.0, -6.0 * seconds / kMaxReverbSeconds);
+}
+
+bool FrameDecoder::begins(int code, Track& t) {
+    for (int w = 0; w < kWindows; ++w) {
+        const SpectrumWindow& win = *mWindows[static_cast<size_t>(w)];
+        // Only samples heard so far, and none from before the code's last end.
+        if (win.length() > mFrames * korvo::kFrameSamples) break;
+        if (t.sinceEnd >= 0 && win.length() > t.sinceEnd * korvo::kFrameSamples) break;
+        const Peak p = find(w, code);
+        if (p.bin < 0 || p.ratio < mRanges[static_cast<size_t>(w)][static_cast<size_t>(code)].start) continue;
+        if (t.sinceEnd >= 0 && p.power < returnLevel(t)) continue;
+        if (harmonicOfStronger(win, p) || !pureLine(win, p)) continue;
+        t.sounding = true;
+        t.holdWindows = std::max(w + 1, 2);
+        t.misses = 0;
+        t.endLevel = 0.0;
+        return true;
+    }
+    return false;
+}
+
+void FrameDecoder::holdOrEnd(int code, Track& t) {
+    double level = 0.0;
+    for (int w = 0; w < t.holdWindows; ++w) {
+        const Peak p = find(w, code);
+        if (p.bin < 0) continue;
+        level = std::max(level, p.power);
+        if (p.ratio >= mRanges[static_cast<size_t>(w)][static_cast<size_t>(code)].hold) {
+            t.misses = 0;
+            t.endLevel = 0.0;
+            return;
+        }
+    }
+    t.endLevel = std::max(t.endLevel, level);
+    if (++t.misses >= kReleaseFrames) {
+        t.sounding = false;
+        t.sinceEnd = 0;
+    }
+}
+
+CodeSet FrameDecoder::addFrame(const int16_t* samples) {
+    constexpr int n = korvo::kFrameSamples;
+    std::memmove(mHistory.data(), mHistory.data() + n, sizeof(float) * (kHistory - n));
+    for (int i = 0; i < n; ++i) mHistory[static_cast<size_t>(kHistory - n + i)] = static_cast<float>(samples[i] * korvo::kInputScale);
+    ++mFrames;
+    for (auto& w : mWindows) {
+        if (w->length() > mFrames * n) break;
+        w->analyse(mHistory.data() + (kHistory - w->length()));
+    }
+    CodeSet began = 0;
+    for (int c = 0; c < kCodes; ++c) {
+        Track& t = mTracks[static_cast<size_t>(c)];
+        if (t.sinceEnd >= 0) ++t.sinceEnd;
+        if (t.sounding) {
+            holdOrEnd(c, t);
+        } else if (begins(c, t)) {
+            began |= codeBit(c);
+        }
+        mSounding = t.sounding ? (mSounding | codeBit(c)) : (mSounding & ~codeBit(c));
+    }
+    return began;
+}
+
+}  // namespace host
+}  // namespace korvo

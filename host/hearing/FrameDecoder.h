@@ -1,0 +1,125 @@
+// The frame decoder: raw captured frames in, code events out. A pure core with no
+// device, thread, plug-in, file or clock: a live listener and an offline one feed it the
+// same frames and hear the same codes.
+//
+// Every frame, Hann windows of several lengths over the newest samples are analysed: the
+// shortest hears a loud tone on the first frame it fills, the longer ones add up a weak
+// tone's energy coherently. Each code has a search range of +-2.5 % around its nominal
+// frequency (a sender's clock may be 2 % off). In a range the highest peak is compared
+// with the noise around it (an order statistic of nearby bins, the louder side of two,
+// see SpectrumWindow); the threshold is the factor that noise alone passes with chance
+// 1e-9 per code and frame, shared among the windows and the range's bins. A peak is a
+// code only when it lies nearest that code's frequency, is no harmonic (of a line down to 80 Hz, the
+// first 40 folded back at half the rate too) of a stronger line sounding with it, and stands as a pure
+// line above the spectrum around it (talk-off).
+//
+// A code is reported once when it begins and stays sounding while its line holds; after
+// it ends, evidence for the same code may only come from samples after the end, and
+// it must come back clearly louder than its echo would be by then (a reverberant tail
+// fades, it does not return).
+//
+// Real time: addFrame neither allocates nor blocks nor makes system calls; all memory is
+// taken by the constructor. Construction and destruction take a lock around FFTW's
+// planner and may run on any thread; one object is fed from one thread at a time.
+#pragma once
+#include <array>
+#include <cstdint>
+#include <memory>
+#include <vector>
+
+#include "host/hearing/Decoder.h"
+#include "host/hearing/SpectrumWindow.h"
+#include "interface/SoundMeterConstants.h"
+
+namespace korvo {
+namespace host {
+
+class FrameDecoder {
+public:
+    static constexpr int kCodes = kHostCodes;  // 0..22: code 23 lies above half the rate
+    // Lengths of the analysis windows, shortest first: one frame for speed, up to about
+    // 280 ms so a 300 ms tone still fills the longest one.
+    // Lengths between 40 ms and 64 ms let such short tones fill a window on most frame
+    // alignments.
+    static constexpr int kWindows = 9;
+    static constexpr std::array<int, kWindows> kWindowLengths = {512, 1024, 1536, 2048, 3072, 4096, 6144, 8192, 12288};
+    // Reference bins on each side: the one-frame window keeps 8 (within 1.4 kHz, so a
+    // sloped spectrum is judged locally; a loud tone passes its higher threshold anyway),
+    // the others 32 (a lower threshold, within 2.8 kHz at 1024 and narrower beyond).
+    static constexpr int kShortReferences = 8;
+    static constexpr int kReferences = 32;
+    static constexpr int kHistory = 12288;
+    static constexpr double kTolerance = 0.025;   // search range: 2 % clock error and a margin
+    static constexpr double kFalseAlarm = 1e-9;   // per code and frame, in noise alone
+    static constexpr double kHoldFalseAlarm = 1e-3;  // a sounding code holds at this weaker evidence
+    static constexpr double kLowestFundamentalHz = 80.0;  // a low voice lies above
+    // Clipping without noise keeps folded harmonics up to the 30th above the floor (code
+    // 3's 28th folds onto code 11). Up to the 16th a line's bin is matched, beyond only
+    // its interpolated frequency, else any stronger code would hide every weaker one.
+    static constexpr int kMaxFoldedHarmonic = 40;
+    static constexpr int kLooseHarmonic = 16;
+    static constexpr int kReleaseFrames = 4;      // frames without the line that end a sounding: an echo beats and dips
+    // An echo fades by 60 dB in at most this long (a large hall); a return of the same code
+    // must stand kReturnFactor above where such a fade would have left the ended sounding.
+    static constexpr double kMaxReverbSeconds = 3.0;
+    static constexpr double kReturnFactor = 10.0;  // 10 dB in power: an echo regrows after its dips by less
+
+    FrameDecoder();
+    ~FrameDecoder();
+    FrameDecoder(const FrameDecoder&) = delete;
+    FrameDecoder& operator=(const FrameDecoder&) = delete;
+
+    // One captured frame of kFrameSamples samples at kSampleRate, in capture order.
+    // Returns the codes that begin at this frame.
+    CodeSet addFrame(const int16_t* samples);
+    // The codes sounding now.
+    CodeSet sounding() const { return mSounding; }
+    // The newest one-frame spectrum, bins 0..255, as levels 100 * (1 + log10(m) / 6) of
+    // magnitude m (a full-scale sine reads about 100), never below 0.
+    void levels(float* out256) const;
+    // Forgets every sample and sounding.
+    void reset();
+
+    // Bins searched for `code` in window `window`, and the factor over the noise that a
+    // peak there must reach to begin a code.
+    int searchBins(int window, int code) const;
+    double threshold(int window, int code) const;
+
+private:
+    struct Range {
+        int lo = 0, hi = 0;
+        double start = 0.0;  // threshold to begin
+        double hold = 0.0;   // threshold to stay sounding
+    };
+    struct Peak {
+        int bin = -1;
+        double hz = 0.0;
+        double power = 0.0;  // interpolated, as a sine's A^2
+        double ratio = 0.0;  // bin power over the noise around it
+    };
+    struct Track {
+        bool sounding = false;
+        int holdWindows = 0;  // windows [0, holdWindows) keep it sounding
+        int misses = 0;
+        double endLevel = 0.0;
+        int64_t sinceEnd = -1;  // frames since its last end, -1 for never
+    };
+
+    Peak find(int window, int code) const;
+    bool harmonicOfStronger(const SpectrumWindow& w, const Peak& p) const;
+    bool pureLine(const SpectrumWindow& w, const Peak& p) const;
+    static double returnLevel(const Track& t);
+    bool begins(int code, Track& t);
+    void holdOrEnd(int code, Track& t);
+
+    std::vector<std::unique_ptr<SpectrumWindow>> mWindows;
+    std::array<std::array<Range, kCodes>, kWindows> mRanges{};
+    double mLineFactor = 0.0;  // a fundamental counts as a line at this factor over its noise
+    std::vector<float> mHistory;
+    int64_t mFrames = 0;
+    std::array<Track, kCodes> mTracks{};
+    CodeSet mSounding = 0;
+};
+
+}  // namespace host
+}  // namespace korvo

@@ -1,0 +1,95 @@
+#include "host/hearing/SpectrumWindow.h"
+
+#include <fftw3.h>
+
+#include <algorithm>
+#include <array>
+#include <cmath>
+#include <mutex>
+
+#include "interface/SoundMeterConstants.h"
+
+namespace korvo {
+namespace host {
+
+namespace {
+constexpr double kPi = 3.14159265358979323846;
+// FFTW's planner is not thread-safe; executing a plan is.
+std::mutex gPlanner;
+}  // namespace
+
+SpectrumWindow::SpectrumWindow(int length, int referenceCount)
+    : mLength(length), mCount(std::min(referenceCount, kMaxReferenceCount)), mBinHz(static_cast<double>(korvo::kSampleRate) / length),
+      mWindow(static_cast<size_t>(length)), mPower(static_cast<size_t>(length / 2 + 1), 0.0f) {
+    // A Hann window's coherent gain is 1/2: a sine of amplitude A reads |X| = A N / 4.
+    const double scale = 4.0 / length;
+    for (int i = 0; i < length; ++i)
+        mWindow[static_cast<size_t>(i)] = static_cast<float>(scale * 0.5 * (1.0 - std::cos(2.0 * kPi * (i + 0.5) / length)));
+    std::lock_guard<std::mutex> lock(gPlanner);
+    mIn = fftwf_alloc_real(static_cast<size_t>(length));
+    auto* out = fftwf_alloc_complex(static_cast<size_t>(bins()));
+    mOut = out;
+    mPlan = fftwf_plan_dft_r2c_1d(length, mIn, out, FFTW_ESTIMATE);
+}
+
+SpectrumWindow::~SpectrumWindow() {
+    std::lock_guard<std::mutex> lock(gPlanner);
+    fftwf_destroy_plan(static_cast<fftwf_plan>(mPlan));
+    fftwf_free(mIn);
+    fftwf_free(static_cast<fftwf_complex*>(mOut));
+}
+
+void SpectrumWindow::analyse(const float* samples) {
+    for (int i = 0; i < mLength; ++i) mIn[i] = samples[i] * mWindow[static_cast<size_t>(i)];
+    fftwf_execute(static_cast<fftwf_plan>(mPlan));
+    const auto* out = static_cast<const fftwf_complex*>(mOut);
+    for (int b = 0; b < bins(); ++b) mPower[static_cast<size_t>(b)] = out[b][0] * out[b][0] + out[b][1] * out[b][1];
+}
+
+bool SpectrumWindow::referenceBelow(int bin, int gap) const {
+    return bin - gap - kReferenceStep * (mCount - 1) >= 1;
+}
+
+bool SpectrumWindow::referenceAbove(int bin, int gap) const {
+    return bin + gap + kReferenceStep * (mCount - 1) <= bins() - 2;
+}
+
+double SpectrumWindow::side(int from, int step) const {
+    std::array<float, kMaxReferenceCount> v{};
+    for (int i = 0; i < mCount; ++i) v[static_cast<size_t>(i)] = power(from + step * i);
+    const int rank = rankOf(mCount);
+    std::nth_element(v.begin(), v.begin() + (rank - 1), v.begin() + mCount);
+    return v[static_cast<size_t>(rank - 1)];
+}
+
+double SpectrumWindow::noise(int bin, int gap) const {
+    double n = 0.0;
+    if (referenceBelow(bin, gap)) n = side(bin - gap, -kReferenceStep);
+    if (referenceAbove(bin, gap)) n = std::max(n, side(bin + gap, kReferenceStep));
+    // Silence (digital zero) still needs a positive estimate.
+    return std::max(n, 1e-20);
+}
+
+int SpectrumWindow::peak(int lo, int hi) const {
+    lo = std::max(lo, 1);
+    hi = std::min(hi, bins() - 2);
+    int best = -1;
+    for (int b = lo; b <= hi; ++b) {
+        const float p = power(b);
+        if (p >= power(b - 1) && p >= power(b + 1) && (best < 0 || p > power(best))) best = b;
+    }
+    return best;
+}
+
+void SpectrumWindow::interpolate(int bin, double* hz, double* power) const {
+    const double a = std::log(std::max(this->power(bin - 1), 1e-30f));
+    const double b = std::log(std::max(this->power(bin), 1e-30f));
+    const double c = std::log(std::max(this->power(bin + 1), 1e-30f));
+    const double den = a - 2.0 * b + c;
+    const double d = den < 0.0 ? std::clamp(0.5 * (a - c) / den, -0.5, 0.5) : 0.0;
+    *hz = (bin + d) * mBinHz;
+    *power = std::exp(b - 0.25 * (a - c) * d);
+}
+
+}  // namespace host
+}  // namespace korvo
