@@ -8,8 +8,20 @@
 namespace korvo {
 namespace host {
 
+std::array<int, BandMeter::kReferenceBins> BandMeter::referenceBins(int code) {
+    std::array<int, kReferenceBins> bins{};
+    const int bin = korvo::codeIndex(code);
+    int found = 0;
+    for (int d = kNearestReference; found < kReferenceBins; ++d) {
+        for (int b : {bin - d, bin + d}) {
+            if (b >= 1 && b <= korvo::kLastSpectrumEntry && found < kReferenceBins) bins[static_cast<size_t>(found++)] = b;
+        }
+    }
+    return bins;
+}
+
 BandMeter::BandMeter() {
-    for (int c = 0; c < kHostCodes; ++c) mReference[static_cast<size_t>(c)] = HostDecision::referenceBins(c);
+    for (int c = 0; c < kHostCodes; ++c) mReference[static_cast<size_t>(c)] = referenceBins(c);
 }
 
 void BandMeter::add(const float* levels, int64_t nowMs) {

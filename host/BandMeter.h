@@ -1,13 +1,12 @@
 // What monitor shows of each code's band, from read-outs that show every bin: the
 // level of the code's own bin now, the highest it reached lately (held for kHoldMs),
-// and the band's noise floor (the mean power of the bins the host's decision compares
-// the code's bin with, averaged over about a second).
+// and the band's noise floor (the mean power of twelve bins 4 to 9 bins from the code's,
+// which its tone's leakage hardly reaches, averaged over about a second).
 #pragma once
 #include <array>
 #include <cstdint>
 
 #include "host/hearing/Decoder.h"
-#include "host/hearing/HostDecision.h"
 
 namespace korvo {
 namespace host {
@@ -24,6 +23,12 @@ public:
         float floor = 0.0f;  // the noise floor as a level; 0 before anything showed
     };
 
+    static constexpr int kReferenceBins = 12;
+    static constexpr int kNearestReference = 4;  // reference bins start this far from the code's bin
+    // The bins of code `code`'s floor: the twelve nearest from kNearestReference bins away,
+    // inside the read-out (code 22 takes more from below).
+    static std::array<int, kReferenceBins> referenceBins(int code);
+
     BandMeter();
     // One read-out (getSpectrumData at the open level) at time `nowMs`.
     void add(const float* levels, int64_t nowMs);
@@ -33,7 +38,7 @@ private:
     std::array<Band, kHostCodes> mBands{};
     std::array<int64_t, kHostCodes> mPeakAt{};
     std::array<double, kHostCodes> mFloorPower{};
-    std::array<std::array<int, HostDecision::kReferenceBins>, kHostCodes> mReference{};
+    std::array<std::array<int, kReferenceBins>, kHostCodes> mReference{};
 };
 
 // The codes a listener has heard, newest first, each with the time it began to be

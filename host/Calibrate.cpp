@@ -1,5 +1,6 @@
-// soundmeter calibrate: listens to the room alone and proposes a detection level
-// (host/hearing/Calibration.h says how).
+// soundmeter calibrate: listens to the room alone and proposes a detection level for
+// the builtin decision (host/hearing/Calibration.h says how), or tells whether the room
+// alone sounds like a code to the host's decoder.
 #include <cmath>
 
 #include <CLI/CLI.hpp>
@@ -20,6 +21,39 @@ struct CalibrateOptions {
     DecoderKind decoder = DecoderKind::Host;
 };
 
+// The host's decoder takes no level: calibration tells whether the room alone sounds
+// like a code to it (a steady tone in the room would be heard every time).
+int hearTheRoom(Session& session, double seconds) {
+    Hearing hearing(session.device(), DecoderKind::Host);
+    const int steps = static_cast<int>(std::lround(seconds * korvo::kSampleRate / korvo::kFrameSamples));
+    CodeSet heard = 0;
+    Outcome outcome = Outcome::Done;
+    for (int i = 0; i < steps; ++i) {
+        if ((outcome = session.interruption()) != Outcome::Done) break;
+        heard |= hearing.step();
+    }
+    session.close();
+    if (outcome != Outcome::Done) return exitStatusOf(outcome);
+    std::string codes;
+    JsonEvent event("calibration");
+    event.add("decoder", decoderName(DecoderKind::Host)).add("seconds", seconds);
+    int count = 0;
+    for (int c = 0; c < kHostCodes; ++c) {
+        if (!(heard & codeBit(c))) continue;
+        codes += (codes.empty() ? "" : ", ") + std::to_string(c);
+        ++count;
+    }
+    event.add("codes_heard", count);
+    infof("host decision: no detection level to set; it compares each code with the noise around it\n");
+    if (count == 0) {
+        resultf(event, "the room alone sounds like no code (host decision, %.1f s)\n", seconds);
+    } else {
+        resultf(event, "the room alone sounds like code%s %s (host decision, %.1f s): a tone in the room\n",
+                count == 1 ? "" : "s", codes.c_str(), seconds);
+    }
+    return 0;
+}
+
 int runCalibrate(const CommonOptions& common, const CalibrateOptions& o) {
     const DecoderKind kind = o.decoder;
     Session session(common);
@@ -28,6 +62,7 @@ int runCalibrate(const CommonOptions& common, const CalibrateOptions& o) {
     settings.routes.mic = true;
     if (int status = session.open(settings)) return status;
     infof("listening to the room for %.1f s; nothing should be said meanwhile\n", o.seconds);
+    if (!decoderInfo(kind).takesLevel) return hearTheRoom(session, o.seconds);
     Hearing hearing(session.device(), kind);
     Calibration calibration;
     const int steps = static_cast<int>(std::lround(o.seconds * korvo::kSampleRate / korvo::kFrameSamples));
@@ -35,23 +70,18 @@ int runCalibrate(const CommonOptions& common, const CalibrateOptions& o) {
     session.close();
     if (outcome != Outcome::Done) return exitStatusOf(outcome);
 
-    const Calibration::Proposal host = calibration.propose(DecoderKind::Host);
-    const Calibration::Proposal builtin = calibration.propose(DecoderKind::Builtin);
-    const Calibration::Proposal& chosen = kind == DecoderKind::Host ? host : builtin;
+    const Calibration::Proposal chosen = calibration.propose(kind);
     if (chosen.silent) {
         infof("the room is silent: the read-out shows no bin above its floor\n");
     } else {
-        infof("the room's noise: median bin level %.1f over %d analysed frames\n", host.noiseLevel, calibration.frames());
-        infof("host's decision: level %d keeps the room's noise in the read-out; its thresholds, relative to the "
-              "noise around each code, keep noise alone under 1 false code in 10,000 steps at any level\n",
-              host.level);
+        infof("the room's noise: median bin level %.1f over %d analysed frames\n", chosen.noiseLevel, calibration.frames());
         infof("builtin decision (HearFreqIdx): level %d, about %.2f false codes in 10,000 steps expected\n",
-              builtin.level, builtin.falsePer10k);
+              chosen.level, chosen.falsePer10k);
     }
     JsonEvent event("calibration");
     event.add("decoder", decoderName(kind)).add("level", chosen.level).add("seconds", o.seconds);
-    event.add("frames", calibration.frames()).add("noise_level", host.noiseLevel);
-    event.add("host_level", host.level).add("builtin_level", builtin.level).add("builtin_false_per_10k", builtin.falsePer10k);
+    event.add("frames", calibration.frames()).add("noise_level", chosen.noiseLevel);
+    event.add("false_per_10k", chosen.falsePer10k);
     resultf(event, "proposed detection level %d (%s decision)\n", chosen.level, decoderName(kind));
     return 0;
 }
@@ -62,9 +92,10 @@ Command addCalibrateCommand(CLI::App& app, CommonOptions& common) {
     auto options = std::make_shared<CalibrateOptions>();
     CLI::App* sub = app.add_subcommand(
         "calibrate",
-        "Listen to the room alone and propose the detection level at which its noise gives fewer than 1 false "
-        "code in 10,000 hearing steps while leaving the most headroom for tones (--level auto does the same "
-        "in 1.5 s before listening).");
+        "Listen to the room alone: for --decoder builtin, propose the detection level at which its noise gives "
+        "fewer than 1 false code in 10,000 hearing steps while leaving the most headroom for tones (--level auto "
+        "does the same in 1.5 s before listening); for the host's decoder, which takes no level, tell whether "
+        "the room alone sounds like a code.");
     sub->add_option("--seconds", options->seconds, "how long to listen to the room")
         ->check(finiteRange(0.5, 3600.0))
         ->capture_default_str();

@@ -71,6 +71,7 @@ public:
 
     int run() {
         applyLogSettings(mCommon.verbose);  // the demo itself only visits the room at the end
+        if (!levelApplies("demo", mOpt.level, mOpt.decoder)) return 2;
         mRoom = uniqueRoomName();
         // --mic / --speaker put both devices on the given routes (a named room that a monitor
         // can join, for instance); a route not given is the fresh room's.
@@ -174,6 +175,7 @@ private:
 
     // --level for the devices: as given; in noise without one, calibrated on the room.
     std::string levelArgument() const {
+        if (!decoderInfo(mOpt.decoder).takesLevel) return "";
         if (mOpt.level.given) return mOpt.level.automatic ? "--level=auto" : "--level=" + std::to_string(mOpt.level.value);
         return mOpt.snrGiven ? "--level=auto" : "";
     }
@@ -442,7 +444,8 @@ Command addDemoCommand(CLI::App& app, CommonOptions& common) {
                     "how long a round may take, its code said again as often as it needs")
         ->check(CLI::Range(500, 600000))
         ->capture_default_str();
-    addLevelOption(sub, &options->level, "the devices' detection level (default: auto with --snr, else the plug-in's)");
+    addLevelOption(sub, &options->level,
+                   "the devices' detection level, for --decoder builtin (default: auto with --snr, else the plug-in's)");
     addDecoderOption(sub, &options->decoder);
     // Both devices use these routes instead of the fresh room (e.g. sim:lab, which a monitor can join).
     addRouteOptions(sub, common, "the fresh room", "the fresh room");

@@ -2,6 +2,8 @@
 
 #include <system/audio.h>
 
+#include <algorithm>
+
 #include "host/Clock.h"
 #include "host/Interrupt.h"
 
@@ -18,6 +20,9 @@ bool Device::open(const DeviceSettings& settings, std::string* error) {
     mMeter->makeToneGenerator(AUDIO_STREAM_MUSIC);
     mMeter->start_wf_thread();
     mMeter->startRecord();
+    // Taken before the warm-up: a decoder of frames hears every frame from the first.
+    mTap = std::make_unique<FrameTap>(mPlugin.frameRecordReader());
+    mFramesCaptured = mFramesTaken = 0;
     mMeter->setRole(settings.role);
     mMeter->setNeedAck(settings.needAck);
     if (settings.setLevel) mMeter->setDetectionLevel(settings.level);
@@ -36,6 +41,7 @@ void Device::close() {
     mMeter->releaseToneGenerator();
     mPlugin.destroy(mMeter);
     mMeter = nullptr;
+    mTap.reset();
 }
 
 Outcome Device::interruption() {
@@ -47,6 +53,18 @@ Outcome Device::interruption() {
 void Device::step() {
     mMeter->processAudio();
     ++mSteps;
+    if (const int16_t* frame = mTap->next()) {
+        std::copy(frame, frame + korvo::kFrameSamples, mKept[static_cast<size_t>(mFramesCaptured % kKeptFrames)].begin());
+        ++mFramesCaptured;
+    }
+}
+
+int Device::takeFrames(const int16_t** out) {
+    const int64_t first = std::max(mFramesTaken, mFramesCaptured - kKeptFrames);
+    int n = 0;
+    for (int64_t f = first; f < mFramesCaptured; ++f) out[n++] = mKept[static_cast<size_t>(f % kKeptFrames)].data();
+    mFramesTaken = mFramesCaptured;
+    return n;
 }
 
 void Device::sayCode(int code, int durationMs) {

@@ -1,9 +1,12 @@
 // One meter object of the plug-in, brought up and down in the order the interface
 // requires, with the polling loops every command uses.
 #pragma once
+#include <array>
 #include <cstdint>
+#include <memory>
 #include <string>
 
+#include "host/FrameTap.h"
 #include "host/Plugin.h"
 #include "host/RouteGuard.h"
 #include "host/hearing/StepClock.h"
@@ -43,10 +46,16 @@ public:
 
     SoundMeter_vir& meter() { return *mMeter; }
 
-    // One capture step (processAudio).
+    // One capture step (processAudio), and the frame it completed, if any, kept for taking.
     void step();
     // Capture steps made since the microphone started: each reads one frame.
     int64_t steps() const { return mSteps; }
+    // The frames captured since the last call, oldest first, into `out` (up to
+    // kKeptFrames; older ones are gone); their count. Valid until the next step.
+    static constexpr int kKeptFrames = 32;
+    int takeFrames(const int16_t** out);
+    // Frames captured since the microphone started, taken or not.
+    int64_t framesCaptured() const { return mFramesCaptured; }
     // Says one code. The saying gate is re-armed first (speaker state 0): on its own
     // the state machine lets a device say once per exchange, and a device running
     // several rounds has to open it again each time.
@@ -62,6 +71,10 @@ private:
     RouteWatch& mWatch;
     SoundMeter_vir* mMeter = nullptr;
     int64_t mSteps = 0;
+    std::unique_ptr<FrameTap> mTap;
+    std::array<std::array<int16_t, korvo::kFrameSamples>, kKeptFrames> mKept{};
+    int64_t mFramesCaptured = 0;
+    int64_t mFramesTaken = 0;  // frames up to this count were taken or dropped
 };
 
 // The exit status that goes with an outcome: 0 done, 1 time up or a failed route, 130 Ctrl-C.

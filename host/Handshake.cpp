@@ -192,6 +192,7 @@ private:
 };
 
 int runHandshake(const CommonOptions& common, const HandshakeOptions& o) {
+    if (!levelApplies("handshake", o.level, o.decoder)) return 2;
     // A device of the demo: the demo stops it with SIGTERM and says why itself.
     if (o.startOnStdin) leaveInterruptionsToParent();
     const bool speaker = o.role == "speaker";
@@ -271,7 +272,7 @@ Command addHandshakeCommand(CLI::App& app, CommonOptions& common) {
         ->check(CLI::Range(0, kHandshakeCodes - 1))
         ->capture_default_str();
     addLevelOption(sub, &options->level,
-                   "detection level: spectrum levels at or below it count as silence (raise it in noise)");
+                   "detection level for --decoder builtin: spectrum levels at or below it count as silence (raise it in noise)");
     addDecoderOption(sub, &options->decoder);
     // The demo's own: not in the help.
     sub->add_flag("--start-on-stdin", options->startOnStdin, "after ready, begin on a line from standard input")->group("");

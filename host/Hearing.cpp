@@ -1,7 +1,5 @@
 #include "host/Hearing.h"
 
-#include <cmath>
-
 #include "host/Clock.h"
 #include "host/Output.h"
 
@@ -12,13 +10,39 @@ Hearing::Hearing(Device& device, DecoderKind kind, bool seeAll)
     : mDevice(device),
       mKind(kind),
       mEar(device.meter()),
-      mDecisionEar(mEar, seeAll),
+      mDecisionEar(mEar, seeAll && decoderInfo(kind).takesLevel),
       mDecoder(makeDecoder(kind)) {}
 
 CodeSet Hearing::step() {
     mDevice.step();
-    mHeard = mDecoder->hear(*mDecisionEar);
-    return mEvents.update(mDevice.steps(), mHeard);
+    const int16_t* frames[Device::kKeptFrames];
+    const int count = mDevice.takeFrames(frames);
+    mEventFrame = 0;
+    if (!decoderInfo(mKind).offline) {  // it hears the plug-in's read-outs after the step
+        StepInput in;
+        in.frames = frames;
+        in.frameCount = count;
+        in.ear = &*mDecisionEar;
+        return mDecoder->hear(in);
+    }
+    // Frame by frame, so that a code's time is the frame where it began, as offline.
+    CodeSet begun = 0;
+    for (int i = 0; i < count; ++i) {
+        StepInput in;
+        in.frames = &frames[i];
+        in.frameCount = 1;
+        ++mFrames;
+        const CodeSet now = mDecoder->hear(in);
+        if (now != 0 && begun == 0) mEventFrame = mFrames;
+        begun |= now;
+    }
+    return begun;
+}
+
+double Hearing::seconds() const {
+    // A decoder of read-outs keeps the step clock: a step reads one frame.
+    if (!decoderInfo(mKind).offline) return stepSeconds(mDevice.steps());
+    return stepSeconds(mEventFrame > 0 ? mEventFrame : mFrames);
 }
 
 Outcome Hearing::waitFor(CodeSet codes, int64_t deadlineMs, int* code) {
@@ -53,12 +77,20 @@ Outcome Hearing::listenToRoom(int steps, Calibration* calibration) {
 }
 
 void Hearing::setLevel(int level) {
+    if (!decoderInfo(mKind).takesLevel) return;
     mDecisionEar->setDetectionLevel(level);
     mDecoder->reset();  // what it saw at another level says nothing at this one
 }
 
+int Hearing::level() { return decoderInfo(mKind).takesLevel ? mDecisionEar->detectionLevel() : -1; }
+
+int Hearing::seenSpectrum(float* out) {
+    if (mDecoder->spectrum(out)) return korvo::kSpectrumBins;
+    return mEar.spectrum(out);
+}
+
 Outcome Hearing::applyLevel(const LevelChoice& level) {
-    if (!level.given) return Outcome::Done;
+    if (!level.given || !decoderInfo(mKind).takesLevel) return Outcome::Done;
     if (!level.automatic) {
         setLevel(level.value);
         return Outcome::Done;

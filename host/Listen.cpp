@@ -90,6 +90,7 @@ int reportCodes(Session& session, Hearing& hearing, const ListenOptions& o) {
 
 int runListen(const CommonOptions& common, const ListenOptions& o) {
     const DecoderKind kind = o.decoder;
+    if (!levelApplies("listen", o.level, kind)) return 2;
     Session session(common);
     DeviceSettings settings;
     settings.role = 1;  // listener without acknowledgement: hearing changes nothing it needs
@@ -115,8 +116,8 @@ Command addListenCommand(CLI::App& app, CommonOptions& common) {
     sub->add_option("--code", options->code, "code to listen for, 0..39 (0..22 can be heard, 0..17 by builtin)")
         ->check(CLI::Range(0, kCodeCount - 1));
     addLevelOption(sub, &options->level,
-                   "detection level: spectrum levels at or below it count as silence (level 100 = full scale, "
-                   "1 unit = 1.2 dB)");
+                   "detection level for --decoder builtin: spectrum levels at or below it count as silence "
+                   "(level 100 = full scale, 1 unit = 1.2 dB)");
     addDecoderOption(sub, &options->decoder);
     sub->add_option("--seconds", options->seconds, "how long to listen; 0: until Ctrl-C (or the file's end)")
         ->check(finiteRange(0.0, 86400.0))

@@ -1,7 +1,8 @@
 // soundmeter monitor: a live view of the read-out in the terminal.
 //
-// The meter's read-out shows every bin (the decoder hears with the detection level
-// applied by the host), so each band's noise floor shows even under the level.
+// It shows the spectrum the decoder heard: the host's decoder its own spectrum of every
+// frame, the builtin decision the meter's read-out at the open level (the decoder hears
+// with the detection level applied by the host), so each band's noise floor shows.
 #include <string>
 
 #include <CLI/CLI.hpp>
@@ -69,6 +70,7 @@ struct View {
     const HeardLog& log;
     CodeSet heardNow;
     int detection;
+    bool hasLevel;  // the decoder takes a detection level
     int bins;
     double elapsed;
     int64_t nowMs;
@@ -79,15 +81,16 @@ void drawFrame(bool ansi, bool first, const View& v) {
     std::string frame;
     if (ansi && !first) frame += "\x1b[" + std::to_string(kFrameLines) + "F";  // back to the frame's top
     char line[256];
-    snprintf(line, sizeof line, "%6.1f s  detection level %d  %s%s", v.elapsed, v.detection,
-             v.bins == 0 ? "(nothing in the read-out)" : "", eol);
+    const std::string level = v.hasLevel ? "detection level " + std::to_string(v.detection) : "no detection level";
+    snprintf(line, sizeof line, "%6.1f s  %s  %s%s", v.elapsed, level.c_str(), v.bins == 0 ? "(nothing in the read-out)" : "",
+             eol);
     frame += line;
     snprintf(line, sizeof line, "%-16s %-*s %5s %5s %5s%s", "", kBarWidth, "# now  - floor  > peak (2 s)  | detection",
              "now", "floor", "peak", eol);
     frame += line;
     for (int c = 0; c < kHostCodes; ++c) {
         const BandMeter::Band& b = v.bands.band(c);
-        snprintf(line, sizeof line, "code %2d %5d Hz %s %5.1f %5.1f %5.1f%s", c, codeHz(c), bar(b, v.detection).c_str(),
+        snprintf(line, sizeof line, "code %2d %5d Hz %s %5.1f %5.1f %5.1f%s", c, codeHz(c), bar(b, v.hasLevel ? v.detection : 0).c_str(),
                  b.now, b.floor, b.peak, eol);
         frame += line;
     }
@@ -99,6 +102,7 @@ void drawFrame(bool ansi, bool first, const View& v) {
 }
 
 int runMonitor(const CommonOptions& common, const MonitorOptions& o) {
+    if (!levelApplies("monitor", o.level, o.decoder)) return 2;
     Session session(common);
     DeviceSettings settings;
     settings.role = 1;
@@ -124,7 +128,8 @@ int runMonitor(const CommonOptions& common, const MonitorOptions& o) {
         const int bins = hearing.seenSpectrum(levels);
         bands.add(levels, now);
         if (now >= nextDraw) {
-            drawFrame(ansi, first, {bands, log, hearing.heardNow(), hearing.level(), bins, (now - start) / 1000.0, now});
+            drawFrame(ansi, first, {bands, log, hearing.heardNow(), hearing.level(), decoderInfo(o.decoder).takesLevel, bins,
+                                       (now - start) / 1000.0, now});
             first = false;
             nextDraw = now + kRefreshMs;
         }

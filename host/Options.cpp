@@ -9,6 +9,8 @@
 
 #include <korvo/platform/Routes.h>
 
+#include "host/Output.h"
+
 namespace korvo {
 namespace host {
 namespace {
@@ -95,13 +97,23 @@ void addLevelOption(CLI::App* sub, LevelChoice* level, const char* help, bool al
 }
 
 void addDecoderOption(CLI::App* sub, DecoderKind* decoder) {
-    static const std::map<std::string, DecoderKind> kKinds = {{"host", DecoderKind::Host},
-                                                             {"builtin", DecoderKind::Builtin}};
-    sub->add_option("--decoder", *decoder,
-                    "how codes are heard: host (each code's own bin, over one or more analysed frames) or builtin "
-                    "(the plug-in's HearFreqIdx decision: one masked spectrum, codes 0..17)")
-        ->transform(CLI::CheckedTransformer(kKinds))
-        ->default_str(decoderName(*decoder));
+    std::map<std::string, DecoderKind> kinds;
+    std::string help = "how codes are heard:";
+    int count = 0;
+    const DecoderInfo* table = decoderTable(&count);
+    for (int i = 0; i < count; ++i) {
+        kinds.emplace(table[i].name, table[i].kind);
+        help += std::string(i == 0 ? " " : "; ") + table[i].name + " (" + table[i].help + ")";
+    }
+    sub->add_option("--decoder", *decoder, help)->transform(CLI::CheckedTransformer(kinds))->default_str(decoderName(*decoder));
+}
+
+bool levelApplies(const char* command, const LevelChoice& level, DecoderKind decoder) {
+    if (!level.given || decoderInfo(decoder).takesLevel) return true;
+    errf("%s: --level does not apply to the %s decoder: it compares each code with the noise around it and "
+         "takes no detection level",
+         command, decoderName(decoder));
+    return false;
 }
 
 void addRouteOptions(CLI::App* sub, CommonOptions& common, const char* micDefault, const char* speakerDefault) {

@@ -46,6 +46,8 @@ struct LevelChoice {
 // Every whole-number option of every command reads its text as decimal; call once
 // the commands are added.
 void readWholeNumbersAsDecimal(CLI::App& app);
+// Whether --level applies to `decoder`: false after saying why, for exit status 2.
+bool levelApplies(const char* command, const LevelChoice& level, DecoderKind decoder);
 // A number that is finite and within [lo, hi] ("nan", "inf" and the like are refused).
 CLI::Validator finiteRange(double lo, double hi);
 // --level L (and "auto" where `allowAuto`).

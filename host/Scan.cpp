@@ -1,9 +1,8 @@
 // soundmeter scan FILE: hears a recording offline, as fast as the processor allows.
 //
-// The library's own analysis and detection code runs in this process on the file's
-// samples, with the timing of a live listener reproduced step by step on the file's
-// clock (host/hearing/SimulatedEar.h): the same codes are heard at the same times as a
-// live `listen` on the file would hear them, given the same phase of the analysis.
+// The recording's frames from its first sample go to the same decoder a live listener
+// feeds with the frames the plug-in captured: scan reports the codes a live `listen` of
+// the file reports, at the same frames. Nothing of the plug-in runs.
 #include <CLI/CLI.hpp>
 
 #include <korvo/platform/Recording.h>
@@ -16,6 +15,7 @@
 #include "host/Options.h"
 #include "host/Output.h"
 #include "host/OfflineRun.h"
+#include "host/hearing/StepClock.h"
 
 namespace korvo {
 namespace host {
@@ -25,12 +25,11 @@ struct ScanOptions {
     std::string file;
     DecoderKind decoder = DecoderKind::Host;
     LevelChoice level;
-    int phase = 0;
 };
 
 int runScan(const CommonOptions& common, const ScanOptions& o) {
     applyLogSettings(common.verbose);
-    const DecoderKind kind = o.decoder;
+    if (!offlineOptionsApply(common, "scan", o.decoder, o.level)) return 2;
     std::string cause;
     std::unique_ptr<korvo::platform::Recording> recording =
         korvo::platform::Recording::open(o.file, korvo::kSampleRate, &cause);
@@ -39,23 +38,14 @@ int runScan(const CommonOptions& common, const ScanOptions& o) {
         return 2;
     }
     const auto began = std::chrono::steady_clock::now();
-    OfflineListener listener(kind, o.phase);
-    bool reportedLevel = false;
-    if (o.level.given && o.level.automatic) listener.calibrateFirst();
-    if (o.level.given && !o.level.automatic) listener.setLevel(o.level.value);
-
+    std::unique_ptr<Decoder> decoder = makeDecoder(o.decoder);
     int count = 0;
     OfflineRun run;
-    const bool read = hearRecording(*recording, listener, 0.0, [&](CodeSet begun) {
-        if (o.level.automatic && !reportedLevel && listener.calibrated()) {
-            reportedLevel = true;
-            infof("detection level %d (calibrated on %.1f s of the recording for the %s decision)\n",
-                  listener.proposal().level, stepSeconds(kAutoCalibrationSteps), decoderName(kind));
-        }
+    const bool read = hearRecording(*recording, *decoder, 0.0, [&](int64_t frames, CodeSet begun) {
         for (int c = 0; c < kCodeCount; ++c) {
             if (!(begun & codeBit(c))) continue;
             ++count;
-            printHeard(c, listener.seconds());
+            printHeard(c, stepSeconds(frames));
         }
     }, &run, &cause);
     if (!read) {
@@ -77,17 +67,12 @@ Command addScanCommand(CLI::App& app, CommonOptions& common) {
     CLI::App* sub = app.add_subcommand(
         "scan",
         "Hear a recording offline, as fast as the processor allows: every code heard, with its time in the "
-        "file, as a live listen on the file hears it (the plug-in's analysis and detection run in this "
-        "process on a simulation of its capture and analysis timing).");
+        "file, as a live listen on the file hears it (its frames go to the decoder a live listener feeds with "
+        "the frames the plug-in captured).");
     sub->add_option("FILE", options->file, "the recording (anything libsndfile reads; - for standard input)")
         ->required();
     addDecoderOption(sub, &options->decoder);
-    addLevelOption(sub, &options->level, "detection level: spectrum levels at or below it count as silence");
-    sub->add_option("--phase", options->phase,
-                    "where the analysis stands against the capture, 0..9: which steps carry its turns (phase "
-                    "mod 2) and the slot it takes first (phase / 2); live, it depends on how the threads started")
-        ->check(CLI::Range(0, kPhases - 1))
-        ->capture_default_str();
+    addLevelOption(sub, &options->level, "detection level, for a decoder that takes one");
     return {sub, [&common, options] { return runScan(common, *options); }};
 }
 

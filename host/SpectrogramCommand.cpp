@@ -1,10 +1,8 @@
-// soundmeter spectrogram: a picture of what a listener's read-out saw, from a
-// microphone route in real time or from a file as fast as the processor allows.
-//
-// Both read the read-out at the open level, so the picture shows the room under the
-// detection level too; the decoder hears with the level applied (LevelledEar), the
-// same codes at the same times as listen or scan.
-
+// soundmeter spectrogram: a picture of the spectrum a listener's decoder heard, from a
+// microphone route in real time or from a file as fast as the processor allows, with
+// the codes it heard, the same as listen or scan. The host's decoder shows its own
+// spectrum of every frame; the builtin decision the plug-in's read-out at the open level
+// (it hears with the level applied by the host: LevelledEar).
 #include <CLI/CLI.hpp>
 
 #include <cmath>
@@ -35,7 +33,6 @@ struct SpectrogramOptions {
     double seconds = 0.0;  // 0: the whole file, or kDefaultLiveSeconds of a microphone
     LevelChoice level;
     DecoderKind decoder = DecoderKind::Host;
-    int phase = 0;
 };
 
 constexpr double kDefaultLiveSeconds = 10.0;
@@ -67,6 +64,7 @@ int finish(const Spectrogram& picture, const PictureTitle& title, const std::str
 
 int fromFile(const CommonOptions& common, const SpectrogramOptions& o) {
     applyLogSettings(common.verbose);
+    if (!offlineOptionsApply(common, "spectrogram", o.decoder, o.level)) return 2;
     std::string cause;
     std::unique_ptr<korvo::platform::Recording> recording =
         korvo::platform::Recording::open(o.file, korvo::kSampleRate, &cause);
@@ -77,30 +75,26 @@ int fromFile(const CommonOptions& common, const SpectrogramOptions& o) {
     double length = recording->totalSeconds();
     if (o.seconds > 0 && (length <= 0 || o.seconds < length)) length = o.seconds;
     Spectrogram picture(stepsIn(length) + kFileTailSteps);
-    OfflineListener listener(o.decoder, o.phase, /*seeAll=*/true);
-    if (o.level.given && o.level.automatic) listener.calibrateFirst();
-    if (o.level.given && !o.level.automatic) listener.setLevel(o.level.value);
+    std::unique_ptr<Decoder> decoder = makeDecoder(o.decoder);
 
     int count = 0;
     OfflineRun run;
     float levels[korvo::kSpectrumBins] = {};
-    const bool read = hearRecording(*recording, listener, o.seconds, [&](CodeSet begun) {
-        // Warm-up and calibration steps stay blank: the listener is not hearing yet.
-        const bool listening = listener.steps() > kWarmUpSteps && !(o.level.automatic && !listener.calibrated());
-        if (!listening) return;
-        listener.seenSpectrum(levels);
-        picture.addStep(listener.steps(), levels);
-        noteHeard(picture, begun, listener.steps(), listener.seconds(), &count);
+    const bool read = hearRecording(*recording, *decoder, o.seconds, [&](int64_t frames, CodeSet begun) {
+        decoder->spectrum(levels);
+        picture.addStep(frames, levels);
+        noteHeard(picture, begun, frames, stepSeconds(frames), &count);
     }, &run, &cause);
     if (!read) {
         errf("spectrogram %s: %s", o.file.c_str(), cause.c_str());
         return 1;
     }
     if (run.interrupted) return 130;
-    return finish(picture, {o.file, run.audioSeconds, listener.level(), o.decoder}, o.png, count);
+    return finish(picture, {o.file, run.audioSeconds, false, 0, o.decoder}, o.png, count);
 }
 
 int fromMicrophone(const CommonOptions& common, const SpectrogramOptions& o) {
+    if (!levelApplies("spectrogram", o.level, o.decoder)) return 2;
     Session session(common);
     DeviceSettings settings;
     settings.role = 1;
@@ -124,7 +118,8 @@ int fromMicrophone(const CommonOptions& common, const SpectrogramOptions& o) {
         picture.addStep(device.steps(), levels);
         noteHeard(picture, begun, device.steps(), hearing.seconds(), &count);
     }
-    const PictureTitle title{korvo::platform::micRoute(), stepSeconds(device.steps()), hearing.level(), o.decoder};
+    const PictureTitle title{korvo::platform::micRoute(), stepSeconds(device.steps()),
+                             decoderInfo(o.decoder).takesLevel, hearing.level(), o.decoder};
     session.close();
     // A route that failed gives no picture: it would show a silence nobody heard.
     if (outcome == Outcome::RouteFailed) return exitStatusOf(outcome);
@@ -162,9 +157,6 @@ Command addSpectrogramCommand(CLI::App& app, CommonOptions& common) {
         ->check(finiteRange(0.0, 86400.0));
     addLevelOption(sub, &options->level, "detection level: spectrum levels at or below it count as silence");
     addDecoderOption(sub, &options->decoder);
-    sub->add_option("--phase", options->phase, "for a FILE: where the analysis stands against the capture, 0..9 (see scan)")
-        ->check(CLI::Range(0, kPhases - 1))
-        ->capture_default_str();
     addRouteOptions(sub, common);
     return {sub, [&common, options] { return runSpectrogram(common, *options); }};
 }

@@ -1,5 +1,5 @@
-// The host's hearing: its decision on read-outs written by the test, the builtin
-// decision's guard, the calibration's proposals and the simulated capture and analysis.
+// The hearing of read-outs: the builtin decision's guard, code events, the calibration's
+// proposals, the simulated capture and analysis, and the levelled ear.
 #include <algorithm>
 #include <array>
 #include <cmath>
@@ -12,9 +12,8 @@
 #include "host/hearing/BuiltinDecision.h"
 #include "host/hearing/Calibration.h"
 #include "host/hearing/CodeEvents.h"
-#include "host/hearing/HostDecision.h"
 #include "host/hearing/LevelledEar.h"
-#include "host/hearing/SimulatedEar.h"
+#include "envelope/simulated/SimulatedEar.h"
 
 namespace {
 
@@ -29,85 +28,6 @@ Levels flat(float base, int code = -1, float over = 0.0f) {
     return l;
 }
 
-// The frame (from 1) on which the code is first heard among `frames` copies; 0 if never.
-int framesToHear(int code, float over, int frames = 8) {
-    HostDecision d;
-    const Levels l = flat(50.0f, code, over);
-    for (int n = 1; n <= frames; ++n) {
-        const CodeSet heard = d.addFrame(l.data(), 0);
-        EXPECT_EQ(heard & ~codeBit(code), 0u) << "another code heard";
-        if (heard & codeBit(code)) return n;
-    }
-    return 0;
-}
-
-TEST(HostDecision, OneLoudFrameOrSeveralFaintOnesAsTheThresholdsSay) {
-    // A level step is 1.2 dB of power: a bin x levels over the reference has ln u = 0.2763 x.
-    // One frame needs 4.018 nats (x >= 14.6); two 5.890, three 7.376, four 8.626, six 10.680,
-    // eight 12.390 (x >= 5.61 each).
-    EXPECT_EQ(framesToHear(5, 15.0f), 1);
-    EXPECT_EQ(framesToHear(5, 14.0f), 2);   // 2 x 3.868
-    EXPECT_EQ(framesToHear(5, 10.0f), 3);   // 2 x 2.763 < 5.890 <= 3 x 2.763
-    EXPECT_EQ(framesToHear(5, 7.0f), 6);    // 4 x 1.934 < 8.626; 6 x 1.934 >= 10.680
-    EXPECT_EQ(framesToHear(5, 5.5f), 0);    // 8 x 1.520 < 12.390
-    // The read-out's last codes and its first, with reference bins on one side near the top.
-    EXPECT_EQ(framesToHear(0, 15.0f), 1);
-    EXPECT_EQ(framesToHear(22, 15.0f), 1);
-
-    // A frame in which the bin dips under the noise (the noise cancelling the tone for a
-    // moment) is no evidence against it: +8 levels four times is heard (4 x 2.21 >= 8.626),
-    // and with a dip among them once six frames add up (5 x 2.21 >= 10.680).
-    {
-        HostDecision dips;
-        const Levels tone = flat(50.0f, 7, 8.0f);
-        const Levels dip = flat(50.0f, 7, -20.0f);
-        const Levels* frames[] = {&tone, &tone, &dip, &tone, &tone, &tone};
-        std::vector<CodeSet> heard;
-        for (const Levels* f : frames) heard.push_back(dips.addFrame(f->data(), 0));
-        EXPECT_EQ(heard, (std::vector<CodeSet>{0, 0, 0, 0, 0, codeBit(7)}));
-    }
-    // Code 22's reference reaches the read-out's last bin: a loud one there hides a faint tone.
-    {
-        HostDecision top;
-        Levels l = flat(50.0f, 22, 15.0f);
-        l[korvo::kSpectrumBins - 1] = 80.0f;
-        EXPECT_EQ(top.addFrame(l.data(), 0), 0u);
-    }
-
-    // A bin that is not a peak of its neighbourhood is not a code: a stronger bin two away,
-    // or a tone halfway between two codes' bins.
-    HostDecision d;
-    Levels beside = flat(50.0f, 9, 30.0f);
-    beside[korvo::codeIndex(9) + 2] = 81.0f;
-    Levels between = flat(50.0f);
-    between[35] = 90.0f;
-    for (int n = 0; n < 8; ++n) {
-        EXPECT_EQ(d.addFrame(beside.data(), 0), 0u);
-        EXPECT_EQ(d.addFrame(between.data(), 0), 0u);
-    }
-}
-
-TEST(HostDecision, HoldsWhileTheToneStaysAndLetsGoAfterThreeFrames) {
-    HostDecision d;
-    const Levels loud = flat(50.0f, 12, 20.0f);
-    const Levels holding = flat(50.0f, 12, 6.0f);  // 7.2 dB over the reference, the hold being 6
-    const Levels gone = flat(50.0f);
-    EXPECT_EQ(d.addFrame(loud.data(), 0), codeBit(12));
-    for (int n = 0; n < 10; ++n) EXPECT_EQ(d.addFrame(holding.data(), 0), codeBit(12)) << n;
-    EXPECT_EQ(d.addFrame(gone.data(), 0), codeBit(12));
-    EXPECT_EQ(d.addFrame(gone.data(), 0), codeBit(12));
-    EXPECT_EQ(d.addFrame(gone.data(), 0), 0u);
-    // Released, the faint tone is heard anew once eight frames of it add up (8 x 1.658 nats).
-    for (int n = 0; n < 7; ++n) EXPECT_EQ(d.addFrame(holding.data(), 0), 0u) << n;
-    EXPECT_EQ(d.addFrame(holding.data(), 0), codeBit(12));
-
-    // Entries at or below the detection level read 0 and count as the level itself.
-    HostDecision quiet;
-    Levels zeros{};
-    EXPECT_EQ(quiet.addFrame(zeros.data(), 60), 0u);
-    zeros[korvo::codeIndex(3)] = 75.0f;
-    EXPECT_EQ(quiet.addFrame(zeros.data(), 60), codeBit(3));
-}
 
 class FakeEar : public Ear {
 public:
@@ -132,19 +52,6 @@ public:
     void setDetectionLevel(int l) override { level = l; }
 };
 
-TEST(HostDecision, ARepeatedReadOutIsNoNewFrameAndALongStillnessLetsGo) {
-    FakeEar ear;
-    HostDecision d;
-    ear.levels = flat(50.0f, 4, 10.0f);  // three frames needed
-    for (int n = 0; n < 5; ++n) EXPECT_EQ(d.hear(ear), 0u);
-    ear.levels[1] = 51.0f;
-    EXPECT_EQ(d.hear(ear), 0u);
-    ear.levels[1] = 52.0f;
-    EXPECT_EQ(d.hear(ear), codeBit(4));
-    for (int n = 1; n < HostDecision::kStaleSteps; ++n) EXPECT_EQ(d.hear(ear), codeBit(4)) << n;
-    EXPECT_EQ(d.hear(ear), 0u);
-}
-
 TEST(BuiltinDecision, ThePeaksAreCodesUnlessAToneAboveTheBandsLeaksIntoThem) {
     FakeEar ear;
     BuiltinDecision d;
@@ -153,20 +60,20 @@ TEST(BuiltinDecision, ThePeaksAreCodesUnlessAToneAboveTheBandsLeaksIntoThem) {
     ear.masked[ear.first] = 60.0f;
     ear.masked[ear.second] = 65.0f;
     ear.levels = flat(30.0f);
-    EXPECT_EQ(d.hear(ear), codeBit(17) | codeBit(4));
+    EXPECT_EQ(d.decide(ear), codeBit(17) | codeBit(4));
     ear.levels[210] = 71.0f;  // 11 levels over entry 200: not yet leakage
-    EXPECT_EQ(d.hear(ear), codeBit(17) | codeBit(4));
+    EXPECT_EQ(d.decide(ear), codeBit(17) | codeBit(4));
     ear.levels[210] = 72.0f;  // code 18's tone: code 17 is its leakage; code 4 stands on its own
-    EXPECT_EQ(d.hear(ear), codeBit(4));
+    EXPECT_EQ(d.decide(ear), codeBit(4));
     ear.levels[210] = 30.0f;
     ear.levels[korvo::codeIndex(17) + 3] = 30.5f;  // rising towards a tone above the bands
-    EXPECT_EQ(d.hear(ear), codeBit(4));
+    EXPECT_EQ(d.decide(ear), codeBit(4));
     ear.first = 35;  // between codes
     ear.second = -1;
-    EXPECT_EQ(d.hear(ear), 0u);
+    EXPECT_EQ(d.decide(ear), 0u);
     ear.masked = Levels{};
     ear.first = korvo::codeIndex(3);
-    EXPECT_EQ(d.hear(ear), 0u);  // nothing analysed yet: an empty read-out
+    EXPECT_EQ(d.decide(ear), 0u);  // nothing analysed yet: an empty read-out
 }
 
 TEST(CodeEvents, AnOnsetAndAgainOnlyAfterAQuietGap) {

@@ -45,6 +45,10 @@ TEST(HostCli, HelpVersionAndBadUsage) {
         {{"listen", "--level", "201"}, "--level"},
         {{"handshake", "--role", "listener", "--level", "-101"}, "--level"},
         {{"-q", "--json", "listen"}, "cannot be used together"},
+        // Options that do not apply are refused with the reason, not ignored.
+        {{"listen", "--level", "30"}, "listen: --level does not apply to the host decoder"},
+        {{"scan", "x.wav", "--plugin", "p.so"}, "scan: --plugin does not apply: a recording is heard without the plug-in"},
+        {{"scan", "x.wav", "--decoder", "builtin"}, "scan: the builtin decoder hears only live"},
     };
     for (const auto& [args, says] : cases) {
         const ProcessResult r = run(args);

@@ -154,14 +154,14 @@ TEST(HostDevices, ListenHandshakeSweepAndMonitorInARoom) {
     // The monitor shows the bands and the code heard, without redraw codes off a terminal.
     const std::string mon = uniqueRoom("monitor");
     HostProcess monitor(kHost);
-    ASSERT_TRUE(monitor.start(in(mon, {"monitor", "--seconds", "60", "--level", "40"})));
+    ASSERT_TRUE(monitor.start(in(mon, {"monitor", "--seconds", "60"})));
     ASSERT_TRUE(monitor.waitForOutput("heard: -\n", kReadyMs));
     EXPECT_EQ(runHost(kHost, in(mon, {"say", "9", "--ms", "800"}), kRunMs).status, 0);
     const bool shown = monitor.waitForOutput("heard: code 9 (10320 Hz) ", kReadyMs);
     monitor.sendSignal(SIGINT);
     r = monitor.finish(kRunMs);
     EXPECT_TRUE(shown) << r.out;
-    EXPECT_NE(r.out.find("detection level 40"), std::string::npos);
+    EXPECT_NE(r.out.find("no detection level"), std::string::npos);
     EXPECT_EQ(r.out.find("\x1b["), std::string::npos);
     EXPECT_FALSE(roomExists(mon));
 }

@@ -9,7 +9,7 @@
 #include <random>
 #include <sstream>
 
-#include "host/hearing/OfflineListener.h"
+#include "envelope/simulated/OfflineListener.h"
 
 namespace korvo {
 namespace envelope {

@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <cmath>
 
-#include "host/hearing/OfflineListener.h"
+#include "envelope/simulated/OfflineListener.h"
 
 namespace korvo {
 namespace envelope {

@@ -20,7 +20,7 @@ bool BuiltinDecision::risesAboveTheBands(const float* levels) {
     return false;
 }
 
-CodeSet BuiltinDecision::hear(Ear& ear) {
+CodeSet BuiltinDecision::decide(Ear& ear) {
     float masked[korvo::kSpectrumBins] = {};
     if (ear.maskedSpectrum(masked) == 0) return 0;  // nothing analysed yet
     int first = -1;

@@ -14,13 +14,13 @@
 namespace korvo {
 namespace host {
 
-class BuiltinDecision : public Decoder {
+class BuiltinDecision {
 public:
     static constexpr float kGuardLevels = 12.0f;  // 14.4 dB; noise alone rarely stands so far out
     static constexpr int kEdgeBins = 3;
 
-    CodeSet hear(Ear& ear) override;
-    void reset() override {}
+    // The codes heard in the read-outs after a capture step.
+    CodeSet decide(Ear& ear);
 
     // Whether the code of masked entry `entry` (level `level`) is leakage of a stronger
     // tone above the bands, by the unmasked read-out `levels`.

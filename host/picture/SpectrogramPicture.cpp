@@ -31,6 +31,8 @@ constexpr int kMinTickSpacing = 70;  // pixels between time labels
 constexpr Rgb kPage{1.0, 1.0, 1.0};
 constexpr Rgb kInk{0.0, 0.0, 0.0};
 constexpr Rgb kNotListening{0.86, 0.86, 0.86};
+// A decoder without a detection level: no level greys anything, and no line is drawn.
+constexpr int kNoLevel = -1000;
 
 // A dark-to-bright map whose brightness rises throughout, so brighter always means louder.
 Rgb heat(double t) {
@@ -136,9 +138,9 @@ void drawTitle(cairo_t* cr, const Spectrogram& sg, const PictureTitle& title) {
     font(cr, kFontSize);
     const double columnMs = stepSeconds(sg.stepsPerColumn()) * 1000.0;
     char s[256];
-    snprintf(s, sizeof s, "%.1f s   detection level %d   %s decision   one column: %.1f ms%s", title.seconds,
-             title.level, decoderName(title.decoder), columnMs,
-             sg.stepsPerColumn() > 1 ? " (the loudest of its steps)" : "");
+    const std::string level = title.hasLevel ? "detection level " + std::to_string(title.level) : "no detection level";
+    snprintf(s, sizeof s, "%.1f s   %s   %s decision   one column: %.1f ms%s", title.seconds, level.c_str(),
+             decoderName(title.decoder), columnMs, sg.stepsPerColumn() > 1 ? " (the loudest of its steps)" : "");
     text(cr, 8, 38, s);
 }
 
@@ -209,6 +211,7 @@ void drawColourScale(cairo_t* cr, const SpectrogramLayout& at, int detection) {
     for (int level = static_cast<int>(kPictureLowLevel); level <= kPictureHighLevel; level += 20) {
         text(cr, left + kBarWidth + 4, yOf(level) + 4, std::to_string(level));
     }
+    if (detection == kNoLevel) return;
     // The detection level: a line across the bar, clamped to its ends when off the scale.
     const double y = yOf(detection);
     cairo_set_line_width(cr, 2.0);
@@ -261,11 +264,12 @@ bool writeSpectrogramPng(const Spectrogram& sg, const PictureTitle& title, const
     cairo_t* cr = context.get();
     setColour(cr, kPage);
     cairo_paint(cr);
-    paintPlot(surface.get(), sg, at, title.level);
+    const int detection = title.hasLevel ? title.level : kNoLevel;
+    paintPlot(surface.get(), sg, at, detection);
     drawTitle(cr, sg, title);
     drawFrequencyAxes(cr, at);
     drawTimeAxis(cr, sg, at);
-    drawColourScale(cr, at, title.level);
+    drawColourScale(cr, at, detection);
     drawHeard(cr, sg, at);
     setColour(cr, kInk);
     cairo_set_line_width(cr, 1.0);

@@ -41,6 +41,7 @@ constexpr float kPictureHighLevel = 100.0f;
 struct PictureTitle {
     std::string source;  // the file or the microphone's route
     double seconds = 0.0;
+    bool hasLevel = false;  // the decoder takes a detection level: `level`
     int level = 0;
     DecoderKind decoder = DecoderKind::Host;
 };

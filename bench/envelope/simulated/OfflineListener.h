@@ -1,14 +1,14 @@
-// A listener that hears a recording offline, as fast as the processor allows, the way
-// a live device hears it: the same warm-up, the same calibration for --level auto,
-// the simulated capture and analysis (SimulatedEar), the decoder and its events.
+// The envelope's listener of a recording: the host's decoder on its frames, as scan hears
+// it, or the plug-in's HearFreqIdx decision the way a live device makes it: the same
+// warm-up, the same calibration for --level auto, and a simulation of the plug-in's
+// capture and analysis timing (SimulatedEar) in place of the plug-in.
 #pragma once
 #include <memory>
 
 #include "host/hearing/Calibration.h"
-#include "host/hearing/CodeEvents.h"
 #include "host/hearing/Decoder.h"
 #include "host/hearing/LevelledEar.h"
-#include "host/hearing/SimulatedEar.h"
+#include "envelope/simulated/SimulatedEar.h"
 #include "host/hearing/StepClock.h"
 
 namespace korvo {
@@ -22,31 +22,31 @@ public:
 
     // A fixed detection level, or calibration on the room after the warm-up.
     void setLevel(int level) { mDecisionEar->setDetectionLevel(level); }
-    void calibrateFirst() { mCalibrating = true; }
+    void calibrateFirst() { mCalibrating = decoderInfo(mKind).takesLevel; }
 
     // One capture step with the next frame of 512 samples: the codes that begin to be
     // heard (none during the warm-up and the calibration).
     CodeSet step(const int16_t* frame);
     // Codes heard at the last step.
-    CodeSet heardNow() const { return mHeard; }
+    CodeSet heardNow() const { return mDecoder->sounding(); }
 
-    int64_t steps() const { return mEar.steps(); }
-    int64_t analysedFrame() const { return mEar.analysedFrame(); }
+    int64_t steps() const { return mSteps; }
+    // The frame the decision looked at last: the newest for a decoder of frames.
+    int64_t analysedFrame() const { return decoderInfo(mKind).offline ? mSteps - 1 : mEar.analysedFrame(); }
     double seconds() const { return stepSeconds(steps()); }
     int level() { return mDecisionEar->detectionLevel(); }
     // The read-out after the last step (getSpectrumData), every bin when seeing all.
     int seenSpectrum(float* out) { return mEar.spectrum(out); }
     // What the calibration proposed, once it has run.
     const Calibration::Proposal& proposal() const { return mProposal; }
-    bool calibrated() const { return mCalibrated; }
+    bool calibrated() const { return mCalibrated || !decoderInfo(mKind).takesLevel; }
 
 private:
     DecoderKind mKind;
     SimulatedEar mEar;
     DecisionEar mDecisionEar;
     std::unique_ptr<Decoder> mDecoder;
-    CodeEvents mEvents;
-    CodeSet mHeard = 0;
+    int64_t mSteps = 0;
     bool mCalibrating = false;
     bool mCalibrated = false;
     Calibration mCalibration;

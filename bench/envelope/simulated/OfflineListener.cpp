@@ -1,4 +1,4 @@
-#include "host/hearing/OfflineListener.h"
+#include "envelope/simulated/OfflineListener.h"
 
 namespace korvo {
 namespace host {
@@ -10,8 +10,15 @@ OfflineListener::OfflineListener(DecoderKind kind, int phase, bool seeAll)
       mDecoder(makeDecoder(kind)) {}
 
 CodeSet OfflineListener::step(const int16_t* frame) {
+    const int64_t n = ++mSteps;
+    if (decoderInfo(mKind).offline) {
+        // A decoder of frames hears every frame from the first, as scan feeds it.
+        StepInput in;
+        in.frames = &frame;
+        in.frameCount = 1;
+        return mDecoder->hear(in);
+    }
     mEar.step(frame);
-    const int64_t n = mEar.steps();
     if (n <= kWarmUpSteps) return 0;
     if (mCalibrating) {
         if (n == kWarmUpSteps + 1) mEar.setDetectionLevel(Calibration::kOpenLevel);
@@ -26,8 +33,9 @@ CodeSet OfflineListener::step(const int16_t* frame) {
         }
         return 0;
     }
-    mHeard = mDecoder->hear(*mDecisionEar);
-    return mEvents.update(n, mHeard);
+    StepInput in;
+    in.ear = &*mDecisionEar;
+    return mDecoder->hear(in);
 }
 
 }  // namespace host

@@ -1,4 +1,4 @@
-#include "host/hearing/SimulatedEar.h"
+#include "envelope/simulated/SimulatedEar.h"
 
 #include <algorithm>
 
