@@ -35,7 +35,7 @@ struct DemoOptions {
     bool noAck = false;
     double snr = 0.0;
     bool snrGiven = false;
-    int toneMs = 300;
+    int toneMs = 64;  // heard to -11 dB SNR; a longer tone only delays the answer it overlaps
     int timeoutMs = 8000;
     LevelChoice level;
     DecoderKind decoder = DecoderKind::Host;
