@@ -8,11 +8,11 @@
 
 #include <CLI/CLI.hpp>
 
-#include "host/CodePlan.h"
-#include "host/Environment.h"
-#include "host/Interrupt.h"
-#include "host/Options.h"
-#include "host/Output.h"
+#include "host/output/CodePlan.h"
+#include "host/core/Environment.h"
+#include "host/base/Interrupt.h"
+#include "host/core/Options.h"
+#include "host/output/Output.h"
 
 using namespace korvo::host;
 

@@ -13,7 +13,7 @@
 
 #include <gtest/gtest.h>
 
-#include "host/Clock.h"
+#include "host/base/Clock.h"
 #include "support/HostProcess.h"
 
 namespace {

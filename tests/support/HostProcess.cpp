@@ -5,7 +5,7 @@
 
 #include <sstream>
 
-#include "host/Clock.h"
+#include "host/base/Clock.h"
 
 namespace korvo {
 namespace testing {

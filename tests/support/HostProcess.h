@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-#include "host/ChildProcess.h"
+#include "host/core/ChildProcess.h"
 
 namespace korvo {
 namespace testing {

@@ -13,7 +13,7 @@
 
 #include <korvo/platform/TestControl.h>
 
-#include "host/ChildProcess.h"
+#include "host/core/ChildProcess.h"
 #include "support/LibraryTestSupport.h"
 
 namespace korvo {
