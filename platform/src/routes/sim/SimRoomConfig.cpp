@@ -1,4 +1,4 @@
-#include "routes/SimRoomConfig.h"
+#include "routes/sim/SimRoomConfig.h"
 
 #include <unistd.h>
 

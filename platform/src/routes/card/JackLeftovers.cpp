@@ -1,4 +1,4 @@
-#include "routes/JackLeftovers.h"
+#include "routes/card/JackLeftovers.h"
 
 #include <fcntl.h>
 #include <log/log.h>

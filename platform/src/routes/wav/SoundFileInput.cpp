@@ -1,4 +1,4 @@
-#include "routes/SoundFileInput.h"
+#include "routes/wav/SoundFileInput.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -8,7 +8,7 @@
 #include <cerrno>
 #include <cstring>
 
-#include "routes/StreamSource.h"
+#include "routes/wav/StreamSource.h"
 
 namespace korvo {
 namespace platform {

@@ -10,7 +10,7 @@
 #include <cstddef>
 #include <cstdint>
 
-#include "routes/SimRoomLayout.h"
+#include "routes/sim/SimRoomLayout.h"
 
 namespace korvo {
 namespace platform {

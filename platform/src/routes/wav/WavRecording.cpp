@@ -14,9 +14,9 @@
 #include <log/log.h>
 #include <utils/Errors.h>
 
-#include "routes/Pacer.h"
-#include "routes/RouteFactories.h"
-#include "routes/SoundFileInput.h"
+#include "routes/common/Pacer.h"
+#include "routes/wav/WavRoutes.h"
+#include "routes/wav/SoundFileInput.h"
 
 namespace korvo {
 namespace platform {

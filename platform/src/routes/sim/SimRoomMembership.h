@@ -18,7 +18,7 @@
 #include <string>
 #include <vector>
 
-#include "routes/SimRoomLayout.h"
+#include "routes/sim/SimRoomLayout.h"
 
 namespace korvo {
 namespace platform {

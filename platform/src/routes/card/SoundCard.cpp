@@ -4,10 +4,10 @@
 
 #include <memory>
 
-#include "routes/CardDevices.h"
-#include "routes/CardSession.h"
-#include "routes/CardStream.h"
-#include "routes/RouteFactories.h"
+#include "routes/RouteBackend.h"
+#include "routes/card/CardDevices.h"
+#include "routes/card/CardSession.h"
+#include "routes/card/CardStream.h"
 
 namespace korvo {
 namespace platform {
@@ -68,11 +68,9 @@ std::unique_ptr<card::Session> prepare(const std::string& device, bool input, Pa
     return session;
 }
 
-}  // namespace
-
-bool checkCardRoute(const std::string& device, bool input, std::string* reason) {
+bool checkCardRoute(const std::string& device, bool speaker, std::string* reason) {
     PaDeviceIndex index = paNoDevice;
-    return prepare(device, input, &index, reason) != nullptr;
+    return prepare(device, !speaker, &index, reason) != nullptr;
 }
 
 std::unique_ptr<CaptureRoute> makeCardCaptureRoute(const std::string& device, std::string* error) {
@@ -88,6 +86,19 @@ std::unique_ptr<OutputRoute> makeCardOutputRoute(const std::string& device, std:
     if (!session) return nullptr;
     return std::make_unique<CardOutputRoute>(std::move(session), index);
 }
+
+}  // namespace
+
+extern const RouteBackend kCardBackend;
+const RouteBackend kCardBackend = {"card",
+                                   "card[:DEVICE]",
+                                   true,
+                                   "a device after 'card:' (or plain card for the default one)",
+                                   makeCardCaptureRoute,
+                                   makeCardOutputRoute,
+                                   checkCardRoute,
+                                   nullptr,
+                                   nullptr};
 
 }  // namespace platform
 }  // namespace korvo

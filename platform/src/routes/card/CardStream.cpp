@@ -1,12 +1,12 @@
-#include "routes/CardStream.h"
+#include "routes/card/CardStream.h"
 
 #include <log/log.h>
 
 #include <algorithm>
 #include <chrono>
 
-#include "routes/CardDevices.h"
-#include "routes/CardSession.h"
+#include "routes/card/CardDevices.h"
+#include "routes/card/CardSession.h"
 
 namespace korvo {
 namespace platform {

@@ -1,4 +1,4 @@
-#include "routes/CardRuntimeDir.h"
+#include "routes/card/CardRuntimeDir.h"
 
 #include <dirent.h>
 #include <unistd.h>

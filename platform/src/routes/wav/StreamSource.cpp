@@ -1,4 +1,4 @@
-#include "routes/StreamSource.h"
+#include "routes/wav/StreamSource.h"
 
 #include <fcntl.h>
 #include <poll.h>

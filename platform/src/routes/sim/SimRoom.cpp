@@ -8,13 +8,13 @@
 #include <cmath>
 #include <cstdint>
 
-#include "routes/RouteFactories.h"
-#include "routes/SimRoomClock.h"
-#include "routes/SimRoomConfig.h"
-#include "routes/SimRoomLayout.h"
-#include "routes/SimRoomMembership.h"
-#include "routes/SimRoomNoise.h"
-#include "routes/SimRoomSlot.h"
+#include "routes/RouteBackend.h"
+#include "routes/sim/SimRoomClock.h"
+#include "routes/sim/SimRoomConfig.h"
+#include "routes/sim/SimRoomLayout.h"
+#include "routes/sim/SimRoomMembership.h"
+#include "routes/sim/SimRoomNoise.h"
+#include "routes/sim/SimRoomSlot.h"
 
 namespace korvo {
 namespace platform {
@@ -167,8 +167,6 @@ private:
     Presence mPresence;
 };
 
-}  // namespace
-
 bool checkSimRoute(const std::string& room, bool speaker, std::string* reason) {
     if (!speaker && !sim::micSettingsFromEnv(reason)) return false;
     return RoomMembership::check(room, speaker ? RoomMembership::Role::Speaker : RoomMembership::Role::Microphone,
@@ -193,6 +191,19 @@ std::unique_ptr<OutputRoute> makeSimOutputRoute(const std::string& room, std::st
     if (!membership) return nullptr;
     return std::make_unique<SimOutputRoute>(std::move(membership));
 }
+
+}  // namespace
+
+extern const RouteBackend kSimBackend;
+const RouteBackend kSimBackend = {"sim",
+                                  "sim:ROOM",
+                                  false,
+                                  "a room name (sim:ROOM)",
+                                  makeSimCaptureRoute,
+                                  makeSimOutputRoute,
+                                  checkSimRoute,
+                                  sim::validateRoomName,
+                                  simRoomSpeakers};
 
 }  // namespace platform
 }  // namespace korvo

@@ -1,4 +1,4 @@
-#include "routes/ResampledInput.h"
+#include "routes/wav/ResampledInput.h"
 
 namespace korvo {
 namespace platform {

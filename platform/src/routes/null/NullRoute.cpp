@@ -3,8 +3,8 @@
 
 #include <utils/Errors.h>
 
-#include "routes/Pacer.h"
-#include "routes/RouteFactories.h"
+#include "routes/RouteBackend.h"
+#include "routes/common/Pacer.h"
 
 namespace korvo {
 namespace platform {
@@ -51,11 +51,21 @@ private:
     OutputPacing mPacing;
 };
 
+std::unique_ptr<CaptureRoute> openCapture(const std::string& /*arg*/, std::string* /*error*/) {
+    return std::make_unique<NullCaptureRoute>();
+}
+
+std::unique_ptr<OutputRoute> openOutput(const std::string& /*arg*/, std::string* /*error*/) {
+    return std::make_unique<NullOutputRoute>();
+}
+
+// Silence and discard are always there.
+bool check(const std::string& /*arg*/, bool /*speaker*/, std::string* /*cause*/) { return true; }
+
 }  // namespace
 
-std::unique_ptr<CaptureRoute> makeNullCaptureRoute() { return std::make_unique<NullCaptureRoute>(); }
-
-std::unique_ptr<OutputRoute> makeNullOutputRoute() { return std::make_unique<NullOutputRoute>(); }
+extern const RouteBackend kNullBackend;
+const RouteBackend kNullBackend = {"null", "null", true, nullptr, openCapture, openOutput, check, nullptr, nullptr};
 
 }  // namespace platform
 }  // namespace korvo

@@ -1,10 +1,10 @@
-#include "routes/SimRoomClock.h"
+#include "routes/sim/SimRoomClock.h"
 
 #include <time.h>
 
 #include <chrono>
 
-#include "routes/SimRoomLayout.h"
+#include "routes/sim/SimRoomLayout.h"
 
 namespace korvo {
 namespace platform {

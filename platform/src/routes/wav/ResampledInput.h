@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "routes/SoundFileInput.h"
+#include "routes/wav/SoundFileInput.h"
 
 namespace korvo {
 namespace platform {

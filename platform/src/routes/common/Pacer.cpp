@@ -1,5 +1,5 @@
 // Real-time timeline of a route.
-#include "routes/Pacer.h"
+#include "routes/common/Pacer.h"
 
 #include <ctime>
 

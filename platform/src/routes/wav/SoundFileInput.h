@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-#include "routes/StreamSource.h"
+#include "routes/wav/StreamSource.h"
 
 namespace korvo {
 namespace platform {

@@ -1,4 +1,4 @@
-#include "routes/SimRoomMembership.h"
+#include "routes/sim/SimRoomMembership.h"
 
 #include <dirent.h>
 #include <fcntl.h>
@@ -15,7 +15,7 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "routes/SimRoomConfig.h"
+#include "routes/sim/SimRoomConfig.h"
 
 namespace korvo {
 namespace platform {

@@ -1,5 +1,5 @@
-#include "routes/RecordingReader.h"
-#include "routes/RouteFactories.h"
+#include "routes/wav/RecordingReader.h"
+#include "routes/wav/WavRoutes.h"
 
 #include <algorithm>
 #include <cmath>

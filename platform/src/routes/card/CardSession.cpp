@@ -1,4 +1,4 @@
-#include "routes/CardSession.h"
+#include "routes/card/CardSession.h"
 
 #include <dlfcn.h>
 #include <log/log.h>
@@ -6,8 +6,8 @@
 #include <cstdarg>
 #include <cstdio>
 
-#include "routes/CardRuntimeDir.h"
-#include "routes/JackLeftovers.h"
+#include "routes/card/CardRuntimeDir.h"
+#include "routes/card/JackLeftovers.h"
 
 #if defined(__SANITIZE_ADDRESS__)
 #define KORVO_LEAK_CHECKER 1

@@ -6,11 +6,11 @@
 
 #include <utils/Errors.h>
 
-#include "routes/Pacer.h"
-#include "routes/RecordingReader.h"
-#include "routes/ResampledInput.h"
-#include "routes/RouteFactories.h"
-#include "routes/SoundFileInput.h"
+#include "routes/common/Pacer.h"
+#include "routes/wav/RecordingReader.h"
+#include "routes/wav/ResampledInput.h"
+#include "routes/wav/WavRoutes.h"
+#include "routes/wav/SoundFileInput.h"
 
 namespace korvo {
 namespace platform {

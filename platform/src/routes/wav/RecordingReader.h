@@ -5,8 +5,8 @@
 
 #include <vector>
 
-#include "routes/ResampledInput.h"
-#include "routes/SoundFileInput.h"
+#include "routes/wav/ResampledInput.h"
+#include "routes/wav/SoundFileInput.h"
 
 namespace korvo {
 namespace platform {

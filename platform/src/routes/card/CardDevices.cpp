@@ -1,4 +1,4 @@
-#include "routes/CardDevices.h"
+#include "routes/card/CardDevices.h"
 
 #include <korvo/platform/Routes.h>
 
@@ -6,7 +6,7 @@
 #include <cctype>
 #include <vector>
 
-#include "routes/CardSession.h"
+#include "routes/card/CardSession.h"
 
 namespace korvo {
 namespace platform {

@@ -1,4 +1,4 @@
-#include "routes/SimRoomSlot.h"
+#include "routes/sim/SimRoomSlot.h"
 
 #include <algorithm>
 
