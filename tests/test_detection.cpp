@@ -139,7 +139,8 @@ TEST_F(Detection, TwoPeakOperationsThroughTheMeter) {
         long ms = -1;
         char rest[128] = {};
         ASSERT_EQ(std::sscanf(lines[0].c_str(), "D/[SoundMeter] TIME[%ld]%127[^\n]", &ms, rest), 2) << lines[0];
-        EXPECT_TRUE(ms >= before && ms <= after) << ms;
+        EXPECT_TRUE(ms >= before) << ms;
+        EXPECT_TRUE(ms <= after) << ms;
         EXPECT_EQ(rest, " Two Max Power is " + std::string(rows[n].log) + " END");
     }
     // The zorv pair: the strongest, then the second scan on it, sorted, nothing logged.
@@ -189,7 +190,9 @@ TEST_F(Detection, FrameVote) {
     int frames[14] = {200, 200, 200, 200, 200, 200, 200, 10, 10, 10, 10, 10, 10, 10}, first = -1, second = -1;
     test::clearLog();
     SoundMeter().detectTwoPeakFrame(frames, &first, &second);
-    EXPECT_TRUE(first == 200 && second == 10 && logOf("TQX", "IN FRAME [").back() == "D/[SoundMeter] DETECTING FREQ IN FRAME [1]");
+    EXPECT_TRUE(first == 200);
+    EXPECT_TRUE(second == 10);
+    EXPECT_TRUE(logOf("TQX", "IN FRAME [").back() == "D/[SoundMeter] DETECTING FREQ IN FRAME [1]");
 }
 
 // ---- the code plan --------------------------------------------------------------
