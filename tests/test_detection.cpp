@@ -1,8 +1,10 @@
 // Detection: the peak scans and the vote as free functions over arrays, the meter's
 // forwarders, and the tone code plan with its look-ups.
+#include <cstddef>
 #include <cstdio>
 #include <cstring>
 #include <limits>
+#include <iterator>
 #include <memory>
 
 #include <utils/Timers.h>
@@ -100,6 +102,19 @@ public:
     }
     Strings calls;
 };
+
+TEST_F(Detection, ALowBandPeakMustRiseAboveTheFloor) {
+    // Entry 0 is the floor: an entry level with it is no peak, one above it is.
+    float s[256] = {};
+    s[0] = 5.0f;
+    s[20] = 5.0f;
+    int second = -1;
+    EXPECT_EQ(korvo::detectLowBandPeak(s, 150, &second), 0.0f);
+    EXPECT_EQ(second, -1);
+    s[30] = 6.0f;
+    EXPECT_EQ(korvo::detectLowBandPeak(s, 150, &second), 6.0f);
+    EXPECT_EQ(second, 30);
+}
 
 TEST_F(Detection, TwoPeakOperationsThroughTheMeter) {
     struct Row {
@@ -259,6 +274,22 @@ TEST_F(CodePlan, BothPlansTheirRecordsAndLogs) {
               (Strings{"D/[MiniToneGenerator] index = 39", "D/[MiniToneGenerator] out of index = 40",
                        "D/END MAKING Tone Generate Table"}));
     EXPECT_EQ(Gen::getFreqTableSize(), 512);
+}
+
+TEST_F(CodePlan, TheExportedTableHasTheRecordLayoutHostsRead) {
+    // Hosts read sToneDescriptors by this layout: 512 records of 13 segments of 16 bytes,
+    // then the code and the frequency code.
+    using android::ToneDescriptor;
+    using android::ToneSegment;
+    EXPECT_EQ(korvo::plan::kSegments, static_cast<int>(std::size(ToneDescriptor{}.segments)));
+    EXPECT_EQ(Gen::NUM_SEGMENTS, 13);
+    EXPECT_EQ(offsetof(ToneSegment, waveFreq), 4u);
+    EXPECT_EQ(offsetof(ToneSegment, loopCnt), 12u);
+    EXPECT_EQ(offsetof(ToneSegment, loopIndex), 14u);
+    EXPECT_EQ(sizeof(ToneDescriptor), 216u);
+    EXPECT_EQ(offsetof(ToneDescriptor, code), 208u);
+    EXPECT_EQ(offsetof(ToneDescriptor, freq_code), 212u);
+    EXPECT_EQ(sizeof(Gen::sToneDescriptors), 512u * 216u);
 }
 
 TEST_F(CodePlan, LookUpsAndPairCorrection) {

@@ -89,6 +89,34 @@ void expectEnd(Engine& gen, const Samples& last) {
     EXPECT_FALSE(test::pumpTrack().called);  // a stopped track makes no more callbacks
 }
 
+TEST_F(Tone, StopCutsAToneThatStartsPlaysOrRestartsOnly) {
+    // A tone starting, playing or restarting is cut to the samples of the time it has run
+    // (1 s here); one already stopping or stopped keeps its end.
+    Engine gen(AUDIO_STREAM_MUSIC, 0.8f, false);
+    for (const uint16_t state : {Engine::TONE_STARTING, Engine::TONE_PLAYING, Engine::TONE_RESTARTING,
+                                 Engine::TONE_STOPPING, Engine::TONE_STOPPED}) {
+        pthread_mutex_lock(&gen.mLock);
+        clock_gettime(CLOCK_MONOTONIC, &gen.mStartTime);
+        gen.mStartTime.tv_sec -= 1;
+        gen.mMaxSmp = 12345;
+        gen.mState.store(state, std::memory_order_relaxed);
+        pthread_mutex_unlock(&gen.mLock);
+        auto stopped = stopAsync(gen);
+        const uint32_t maxSmp = locked(gen, &Engine::mMaxSmp);
+        pthread_mutex_lock(&gen.mLock);  // stopTone waits for a callback: this is it
+        pthread_cond_signal(&gen.mWaitCbkCond);
+        pthread_mutex_unlock(&gen.mLock);
+        ASSERT_TRUE(ready(stopped)) << "state " << state;
+        if (state == Engine::TONE_STOPPING || state == Engine::TONE_STOPPED) {
+            EXPECT_EQ(maxSmp, 12345u) << "state " << state;
+        } else {
+            EXPECT_GE(maxSmp, 44100u) << "state " << state;
+            EXPECT_LT(maxSmp, 2 * 44100u) << "state " << state;
+        }
+        gen.mState.store(Engine::TONE_INIT, std::memory_order_relaxed);
+    }
+}
+
 TEST_F(Tone, LimitedToneBlockByBlock) {
     Engine gen(AUDIO_STREAM_MUSIC, 0.8f, false);
     RefWave ref(44100, 2580);
