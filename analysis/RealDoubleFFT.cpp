@@ -2,7 +2,7 @@
 
 #include <cmath>
 
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
 
 // Mixed-radix real forward transform; every table read goes through the guarded read of
 // its table. The radix-3, radix-5 and general passes keep the classic column-major index

@@ -4,7 +4,7 @@
 
 #include "analysis/RealDoubleFFT.h"
 #include "analysis/WaveformCanvas.h"
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
 #include "interface/SoundMeterConstants.h"
 
 namespace android {

@@ -5,7 +5,7 @@
 #include <cstdio>
 
 #include "capture/FrameExchange.h"
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
 #include "interface/SoundMeterConstants.h"
 
 namespace android {

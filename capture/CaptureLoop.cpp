@@ -9,7 +9,7 @@
 
 #include "capture/CaptureLoop.h"
 #include "capture/FrameExchange.h"
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
 
 using korvo::kRingSlots;
 #include "meter/SoundMeter.h"

@@ -6,7 +6,7 @@
 
 #include <media/AudioRecord.h>
 
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
 #include "meter/SoundMeter.h"
 
 using android::AudioRecord;

@@ -5,7 +5,7 @@
 #include <cstring>
 
 #include "analysis/WaveformCanvas.h"
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
 
 namespace {
 

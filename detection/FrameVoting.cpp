@@ -4,7 +4,7 @@
 
 #include <cstdint>
 
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
 
 namespace korvo {
 

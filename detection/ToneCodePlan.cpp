@@ -1,6 +1,6 @@
 #include "detection/ToneCodePlan.h"
 
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
 #include "interface/SoundMeterConstants.h"
 
 namespace korvo {

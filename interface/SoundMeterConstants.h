@@ -1,5 +1,6 @@
 // The numbers both ends of the link and every host agree on: capture sizes, the
-// analyser's scale, the single-frequency code plan and the masked read-out's bands.
+// analyser's scale, the single-frequency code plan, the masked read-out's bands and the
+// pace a host keeps.
 // The library and the soundmeter host take them from here; nothing re-derives them.
 #pragma once
 
@@ -46,9 +47,17 @@ constexpr bool inCodeBand(int k) {
            (k % 10 == 0 || (k % 10 >= 3 && k % 10 <= 7));
 }
 
-// Whether a code of the plan can be heard through the masked read-out, or lies inside
-// the spectrum but outside the bands.
+// Whether a code of the plan can be heard through the masked read-out.
 constexpr bool codeHearable(int code) { return code >= 0 && code < kPlanCodes && inCodeBand(codeIndex(code)); }
-constexpr bool codeInSpectrum(int code) { return code >= 0 && codeIndex(code) < kSpectrumBins; }
+
+// ---- what a host needs to know ------------------------------------------------------
+// Capture steps (processAudio calls) a device makes before it listens (151 ms): five frames
+// of 11.6 ms fill the ring, and the analysis thread, one frame per 20 ms turn, takes frames
+// that were captured. A count of steps, not a time: a recording loses the same frames live
+// and offline.
+constexpr int kWarmUpSteps = 13;
+// Time a tone needs after its duration to be out of the room, in ms: the fade-out block
+// (20 ms), the route's latency and some slack for a loaded machine.
+constexpr int kToneTailMs = 250;
 
 }  // namespace korvo

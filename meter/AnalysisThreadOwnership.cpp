@@ -2,7 +2,7 @@
 // operations that forward to it.
 #include "analysis/WaveformCanvas.h"
 #include "capture/FrameExchange.h"
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
 #include "meter/SoundMeter.h"
 
 void SoundMeter::start_wf_thread() {

@@ -5,7 +5,7 @@
 
 #include "detection/FrameVoting.h"
 #include "detection/PeakDetection.h"
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
 #include "meter/SoundMeter.h"
 #include "tone/MiniToneGenerator.h"
 

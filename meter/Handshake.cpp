@@ -5,7 +5,8 @@
 
 #include <utils/Timers.h>
 
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
+#include "interface/SoundMeterConstants.h"
 #include "meter/Handshake.h"
 #include "meter/SoundMeter.h"
 #include "tone/MiniToneGenerator.h"
@@ -35,8 +36,6 @@ bool sayingGateOpen(const SoundMeter& m) {
     return ((m.role & kSpeakerBit) && m.speaker_state == 0) ||
            ((m.role & kListenerBit) && m.listener_state == 1 && m.need_ack == 1);
 }
-
-int acknowledgementOf(int tone, int tableSize) { return (tone + 1) % tableSize; }
 
 }  // namespace korvo
 
@@ -68,7 +67,7 @@ int SoundMeter::HearFreqIdx(int toneIndex) {
         METER_LOGD("[%s:%d] TIME [%ld] Listener Transit To %d\n", 530,
                             nowMs(), listener_state);
     } else if ((role & kSpeakerBit) && speaker_state == 1) {
-        if (toneIndex == korvo::acknowledgementOf(last_said, android::MiniToneGenerator::getFreqTableSize())) {
+        if (toneIndex == korvo::acknowledgementOf(last_said)) {
             speaker_state = 10;
         }
         METER_LOGD("[%s:%d] TIME [%ld] Speaker Transit To %d.Heard [%d] last_said[%d]\n", 538,
@@ -142,7 +141,7 @@ void SoundMeter::SayAllFreqIndex(int durationMs) {
         code = getFreqCodeFromIndex(0);
     }
     if (listener_state == 1 && need_ack == 1) {
-        play_sound = korvo::acknowledgementOf(last_heard, android::MiniToneGenerator::getFreqTableSize());
+        play_sound = korvo::acknowledgementOf(last_heard);
         printf("[%s:%d] TIME [%ld] Listener Transit To %d. last_heard[%d] play_sound[%d]\n", korvo::kMeterWho, 911, nowMs(),
                listener_state, last_heard, play_sound);
     }

@@ -9,7 +9,5 @@ namespace korvo {
 bool hearingGateOpen(const SoundMeter& m);
 // (speaker bit and speaker state 0) or (listener bit, listener state 1 and acknowledgement on).
 bool sayingGateOpen(const SoundMeter& m);
-// The tone that acknowledges `tone`: the next one, modulo the table size (signed remainder).
-int acknowledgementOf(int tone, int tableSize);
 
 }  // namespace korvo

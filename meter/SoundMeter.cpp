@@ -2,7 +2,7 @@
 #include "meter/SoundMeter.h"
 
 #include "capture/CaptureStream.h"
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
 
 SoundMeter::SoundMeter()
     : sampleRate(korvo::kSampleRate),

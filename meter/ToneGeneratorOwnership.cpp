@@ -1,5 +1,5 @@
 // The meter object's ownership of its tone generator.
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
 #include "meter/SoundMeter.h"
 #include "tone/MiniToneGenerator.h"
 

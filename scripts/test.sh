@@ -21,5 +21,8 @@ for preset in "${presets[@]}"; do
   if ! ctest --preset "$preset"; then
     status=1
   fi
+  # CTest names the skipped tests; this says why each was skipped.
+  if [ "$preset" = default ]; then dir=build; else dir="build-$preset"; fi
+  scripts/skip-reasons.sh "$dir"
 done
 exit $status

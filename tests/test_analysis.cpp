@@ -152,7 +152,10 @@ TEST_F(Analysis, AnalyserMagnitudes) {
     // setInput converts exactly 512 samples, or logs and writes nothing.
     std::vector<double> out(514, 5.0);
     canvas->SpectrumAnalyser_setInput(longer.data(), 50, 512, out.data() + 1);
-    EXPECT_TRUE(out[0] == 5.0 && out[513] == 5.0 && out[1] == longer[50] / 32768.0 && out[512] == longer[561] / 32768.0);
+    EXPECT_TRUE(out[0] == 5.0);
+    EXPECT_TRUE(out[513] == 5.0);
+    EXPECT_TRUE(out[1] == longer[50] / 32768.0);
+    EXPECT_TRUE(out[512] == longer[561] / 32768.0);
     canvas->SpectrumAnalyser_setInput(longer.data(), 0, 511, out.data());
     EXPECT_EQ(out[0], 5.0);
     // Result tables of other sizes: the entries that fit, nothing past the end.
@@ -221,7 +224,10 @@ TEST_F(Analysis, ReadOutLevelsThresholdsAndMask) {
     auto readOut = [&](bool masked, int wantCount) {
         std::vector<float> buf(258, 7.5f);  // a guard on each side
         EXPECT_EQ(masked ? canvas->getSpectrumData_zorv(&buf[1]) : canvas->getSpectrumData(&buf[1]), wantCount);
-        EXPECT_TRUE(buf[0] == 7.5f && buf[1] == 7.5f && buf[257] == 7.5f && (!masked || buf[2] == 7.5f));
+        EXPECT_TRUE(buf[0] == 7.5f);
+        EXPECT_TRUE(buf[1] == 7.5f);
+        EXPECT_TRUE(buf[257] == 7.5f);
+        EXPECT_TRUE((!masked || buf[2] == 7.5f));
         return std::vector<float>(buf.begin() + 1, buf.end() - 1);
     };
     auto setBins = [&](const std::vector<std::pair<int, double>>& bins) {
@@ -262,7 +268,8 @@ TEST_F(Analysis, ReadOutLevelsThresholdsAndMask) {
     setBins({{29, 1e-3}, {32, 0.01}});
     stdoutOf([&] { canvas->setDetectionLevel(50); });
     const std::vector<float> t = readOut(true, 2);
-    EXPECT_TRUE(t[30] == 0.0f && t[33] == 66.66667f);
+    EXPECT_TRUE(t[30] == 0.0f);
+    EXPECT_TRUE(t[33] == 66.66667f);
 }
 
 // Publishes a record whose five slots hold a tone on bin(k).

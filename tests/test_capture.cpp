@@ -128,7 +128,10 @@ TEST_F(Capture, MinimumBufferSize) {
 
 TEST_F(Capture, SharedRecordAndLevels) {
     const Mmic_data_t fresh = readShared();
-    EXPECT_TRUE(fresh.index == 0 && fresh.level == 0.0f && fresh.count == 0 && fresh.reserved == 0);
+    EXPECT_TRUE(fresh.index == 0);
+    EXPECT_TRUE(fresh.level == 0.0f);
+    EXPECT_TRUE(fresh.count == 0);
+    EXPECT_TRUE(fresh.reserved == 0);
     for (int16_t s : fresh.data) ASSERT_EQ(s, 0);
     readShared();
     EXPECT_EQ(logOf("TQX"), Strings{"D/[SoundMeter] Initialize MDATA"});
@@ -270,7 +273,8 @@ TEST_F(Capture, HearingOnAnUnusableRouteIsPacedLikeAMicrophone) {
     meter.startRecord();
     unsetenv("KORVO_MIC");
     const korvo::platform::RouteStatus status = korvo::platform::microphoneStatus();
-    EXPECT_TRUE(status.failed && status.reason.rfind("wav:/nonexistent/x.wav: cannot", 0) == 0) << status.reason;
+    EXPECT_TRUE(status.failed) << status.reason;
+    EXPECT_TRUE(status.reason.rfind("wav:/nonexistent/x.wav: cannot", 0) == 0) << status.reason;
     timespec cpu0, cpu1;
     clock_gettime(CLOCK_THREAD_CPUTIME_ID, &cpu0);
     const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(1);
@@ -305,9 +309,11 @@ TEST_F(Capture, PublishedFrameWaitsForTheAnalysisThread) {
     EXPECT_EQ(korvo::captureWaitNs(11, 1000), 10000);
     EXPECT_EQ(korvo::captureWaitNs(11, 6000), 5000);
     const timespec d = korvo::captureDeadline({7, 999999999}, 2500000001LL);
-    EXPECT_TRUE(d.tv_sec == 10 && d.tv_nsec == 500000000) << d.tv_sec << "." << d.tv_nsec;
+    EXPECT_TRUE(d.tv_sec == 10) << d.tv_sec << "." << d.tv_nsec;
+    EXPECT_TRUE(d.tv_nsec == 500000000) << d.tv_sec << "." << d.tv_nsec;
     const timespec e = korvo::captureDeadline({100, 999998000}, 5000);
-    EXPECT_TRUE(e.tv_sec == 101 && e.tv_nsec == 3000) << e.tv_sec << "." << e.tv_nsec;
+    EXPECT_TRUE(e.tv_sec == 101) << e.tv_sec << "." << e.tv_nsec;
+    EXPECT_TRUE(e.tv_nsec == 3000) << e.tv_sec << "." << e.tv_nsec;
 }
 
 }  // namespace

@@ -1,8 +1,10 @@
 // Detection: the peak scans and the vote as free functions over arrays, the meter's
 // forwarders, and the tone code plan with its look-ups.
+#include <cstddef>
 #include <cstdio>
 #include <cstring>
 #include <limits>
+#include <iterator>
 #include <memory>
 
 #include <utils/Timers.h>
@@ -101,6 +103,19 @@ public:
     Strings calls;
 };
 
+TEST_F(Detection, ALowBandPeakMustRiseAboveTheFloor) {
+    // Entry 0 is the floor: an entry level with it is no peak, one above it is.
+    float s[256] = {};
+    s[0] = 5.0f;
+    s[20] = 5.0f;
+    int second = -1;
+    EXPECT_EQ(korvo::detectLowBandPeak(s, 150, &second), 0.0f);
+    EXPECT_EQ(second, -1);
+    s[30] = 6.0f;
+    EXPECT_EQ(korvo::detectLowBandPeak(s, 150, &second), 6.0f);
+    EXPECT_EQ(second, 30);
+}
+
 TEST_F(Detection, TwoPeakOperationsThroughTheMeter) {
     struct Row {
         Peaks peaks;
@@ -139,7 +154,8 @@ TEST_F(Detection, TwoPeakOperationsThroughTheMeter) {
         long ms = -1;
         char rest[128] = {};
         ASSERT_EQ(std::sscanf(lines[0].c_str(), "D/[SoundMeter] TIME[%ld]%127[^\n]", &ms, rest), 2) << lines[0];
-        EXPECT_TRUE(ms >= before && ms <= after) << ms;
+        EXPECT_TRUE(ms >= before) << ms;
+        EXPECT_TRUE(ms <= after) << ms;
         EXPECT_EQ(rest, " Two Max Power is " + std::string(rows[n].log) + " END");
     }
     // The zorv pair: the strongest, then the second scan on it, sorted, nothing logged.
@@ -189,7 +205,9 @@ TEST_F(Detection, FrameVote) {
     int frames[14] = {200, 200, 200, 200, 200, 200, 200, 10, 10, 10, 10, 10, 10, 10}, first = -1, second = -1;
     test::clearLog();
     SoundMeter().detectTwoPeakFrame(frames, &first, &second);
-    EXPECT_TRUE(first == 200 && second == 10 && logOf("TQX", "IN FRAME [").back() == "D/[SoundMeter] DETECTING FREQ IN FRAME [1]");
+    EXPECT_TRUE(first == 200);
+    EXPECT_TRUE(second == 10);
+    EXPECT_TRUE(logOf("TQX", "IN FRAME [").back() == "D/[SoundMeter] DETECTING FREQ IN FRAME [1]");
 }
 
 // ---- the code plan --------------------------------------------------------------
@@ -256,6 +274,22 @@ TEST_F(CodePlan, BothPlansTheirRecordsAndLogs) {
               (Strings{"D/[MiniToneGenerator] index = 39", "D/[MiniToneGenerator] out of index = 40",
                        "D/END MAKING Tone Generate Table"}));
     EXPECT_EQ(Gen::getFreqTableSize(), 512);
+}
+
+TEST_F(CodePlan, TheExportedTableHasTheRecordLayoutHostsRead) {
+    // Hosts read sToneDescriptors by this layout: 512 records of 13 segments of 16 bytes,
+    // then the code and the frequency code.
+    using android::ToneDescriptor;
+    using android::ToneSegment;
+    EXPECT_EQ(korvo::plan::kSegments, static_cast<int>(std::size(ToneDescriptor{}.segments)));
+    EXPECT_EQ(Gen::NUM_SEGMENTS, 13);
+    EXPECT_EQ(offsetof(ToneSegment, waveFreq), 4u);
+    EXPECT_EQ(offsetof(ToneSegment, loopCnt), 12u);
+    EXPECT_EQ(offsetof(ToneSegment, loopIndex), 14u);
+    EXPECT_EQ(sizeof(ToneDescriptor), 216u);
+    EXPECT_EQ(offsetof(ToneDescriptor, code), 208u);
+    EXPECT_EQ(offsetof(ToneDescriptor, freq_code), 212u);
+    EXPECT_EQ(sizeof(Gen::sToneDescriptors), 512u * 216u);
 }
 
 TEST_F(CodePlan, LookUpsAndPairCorrection) {

@@ -127,7 +127,9 @@ TEST_F(Handshake, Sweep) {
     meter.last_heard = 7;
     std::string out = sweep(20);
     EXPECT_EQ(toneAsked(), 8);
-    EXPECT_TRUE(meter.listener_state == 10 && play_sound == 9 && meter.last_said == 8);
+    EXPECT_TRUE(meter.listener_state == 10);
+    EXPECT_TRUE(play_sound == 9);
+    EXPECT_TRUE(meter.last_said == 8);
     EXPECT_TRUE(has(out, R"(\[SoundMeter:911\] TIME \[\d+\] Listener Transit To 1\. last_heard\[7\] play_sound\[8\]\n)"));
     EXPECT_TRUE(has(out, R"(\[SoundMeter\] CNT TIME TONE PLAYING\[8:30000\]------------\[\d+\] From Prev Play \[\d+\]\n)"));
     EXPECT_TRUE(has(out, R"(\[SoundMeter:922\] TIME \[\d+\] Listener Transit To 10\n)"));
@@ -136,7 +138,10 @@ TEST_F(Handshake, Sweep) {
     set(2, 1, 0, 0);
     play_sound = 5, last_play_time = 0;
     out = sweep(20);
-    EXPECT_TRUE(toneAsked() == 5 && meter.last_said == 5 && meter.speaker_state == 1 && play_sound == 6);
+    EXPECT_TRUE(toneAsked() == 5);
+    EXPECT_TRUE(meter.last_said == 5);
+    EXPECT_TRUE(meter.speaker_state == 1);
+    EXPECT_TRUE(play_sound == 6);
     EXPECT_TRUE(has(out, R"(\[SoundMeter:937\] TIME \[\d+\] Speaker Transit To 1\n)"));
     EXPECT_EQ(sweep(20), "");
 
@@ -144,16 +149,21 @@ TEST_F(Handshake, Sweep) {
     set(2, 0, 0, 0);
     play_sound = 0, last_play_time = 0;
     sweep(200);
-    EXPECT_TRUE(toneAsked() == 0 && meter.speaker_state == 10 && play_sound == 1);
+    EXPECT_TRUE(toneAsked() == 0);
+    EXPECT_TRUE(meter.speaker_state == 10);
+    EXPECT_TRUE(play_sound == 1);
     last_play_time = systemTime(SYSTEM_TIME_MONOTONIC) - 450LL * 1000000;
     out = sweep(200);
     EXPECT_TRUE(std::regex_match(out, std::regex(R"(\[SoundMeter\] SoundMeter Works as Speaker Only, then it'll not say before sleeping saytime\+50msec\.\[4\d\d\]\n)")))
         << out;
-    EXPECT_TRUE(toneAsked() == 0 && play_sound == 1);
+    EXPECT_TRUE(toneAsked() == 0);
+    EXPECT_TRUE(play_sound == 1);
     last_play_time = systemTime(SYSTEM_TIME_MONOTONIC) - 560LL * 1000000;
     out = sweep(200);
     EXPECT_TRUE(has(out, R"(\[SoundMeter:884\] TIME \[\d+\] Speaker Transit To 0\n)"));
-    EXPECT_TRUE(toneAsked() == 2 && meter.speaker_state == 10 && play_sound == 3);
+    EXPECT_TRUE(toneAsked() == 2);
+    EXPECT_TRUE(meter.speaker_state == 10);
+    EXPECT_TRUE(play_sound == 3);
 
     // The end record and indices past the table start the sweep again at 0.
     for (int start : {40, 512, -3}) {

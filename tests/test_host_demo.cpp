@@ -41,14 +41,20 @@ TEST(HostDemo, ExchangesWithAcknowledgementAsJsonEvents) {
         const auto* e = &events[size_t(round - 1) * 5];
         const int k = 2 * (round - 1);  // the speaker says 0, 2, 4; the listener answers k + 1
         EXPECT_EQ(e[0], (nlohmann::json{{"event", "said"}, {"device", "speaker"}, {"round", round}, {"code", k}, {"attempt", 1}}));
-        EXPECT_TRUE(e[1]["device"] == "listener" && e[1]["code"] == k && e[1]["one_way_ms"] >= 0) << e[1];
-        EXPECT_TRUE(e[2]["device"] == "listener" && e[2]["code"] == k + 1) << e[2];
-        EXPECT_TRUE(e[3]["device"] == "speaker" && e[3]["code"] == k + 1 && e[3]["one_way_ms"] >= 0) << e[3];
-        EXPECT_TRUE(e[4]["event"] == "exchange" && e[4]["answer"] == k + 1 &&
-                    e[4]["round_trip_ms"] >= e[1]["one_way_ms"].get<int>() + e[3]["one_way_ms"].get<int>())
-            << e[4];
+        EXPECT_TRUE(e[1]["device"] == "listener") << e[1];
+        EXPECT_TRUE(e[1]["code"] == k) << e[1];
+        EXPECT_TRUE(e[1]["one_way_ms"] >= 0) << e[1];
+        EXPECT_TRUE(e[2]["device"] == "listener") << e[2];
+        EXPECT_TRUE(e[2]["code"] == k + 1) << e[2];
+        EXPECT_TRUE(e[3]["device"] == "speaker") << e[3];
+        EXPECT_TRUE(e[3]["code"] == k + 1) << e[3];
+        EXPECT_TRUE(e[3]["one_way_ms"] >= 0) << e[3];
+        EXPECT_TRUE(e[4]["event"] == "exchange") << e[4];
+        EXPECT_TRUE(e[4]["answer"] == k + 1) << e[4];
+        EXPECT_TRUE(e[4]["round_trip_ms"] >= e[1]["one_way_ms"].get<int>() + e[3]["one_way_ms"].get<int>()) << e[4];
     }
-    EXPECT_TRUE(events.back()["event"] == "summary" && events.back()["completed"] == 3) << events.back();
+    EXPECT_TRUE(events.back()["event"] == "summary") << events.back();
+    EXPECT_TRUE(events.back()["completed"] == 3) << events.back();
     EXPECT_FALSE(roomExists(room));  // its last member left
 }
 
@@ -128,12 +134,13 @@ TEST(HostDevices, ListenHandshakeSweepAndMonitorInARoom) {
     EXPECT_EQ(r.status, 0);
     EXPECT_TRUE(std::regex_match(r.out, std::regex("listening for code 7 \\(8600 Hz\\)\nheard code 7 \\(8600 Hz\\) at [0-9.]+ s, after [0-9]+ ms of listening\n")));
     r = runHost(kHost, in(uniqueRoom("miss"), {"listen", "--code", "3", "--seconds", "0.5"}), kRunMs);
-    EXPECT_TRUE(r.status == 1 && r.err == "soundmeter: code 3 (5160 Hz) not heard within 0.5 s\n") << r.err;
+    EXPECT_TRUE(r.status == 1) << r.err;
+    EXPECT_TRUE(r.err == "soundmeter: code 3 (5160 Hz) not heard within 0.5 s\n") << r.err;
 
     // A lone handshake listener from a chosen code gives up after its timeout (two devices: the demo).
     r = runHost(kHost, in(uniqueRoom("hs"), {"handshake", "--role", "listener", "--first-code", "5", "--timeout-ms", "500"}), kRunMs);
-    EXPECT_TRUE(r.status == 1 && std::regex_search(r.out, std::regex("\ntimeout round=1 code=5 hz=6880 t=[0-9]+ waited=[0-9]+\n")))
-        << r.out;
+    EXPECT_TRUE(r.status == 1) << r.out;
+    EXPECT_TRUE(std::regex_search(r.out, std::regex("\ntimeout round=1 code=5 hz=6880 t=[0-9]+ waited=[0-9]+\n"))) << r.out;
 
     // A sweep alone walks the codes every listener reports: 0, 1, 2, ...; over the whole
     // plan, the plug-in's own walk steps one on saying and one on its pause: 0, 2, 4, ...

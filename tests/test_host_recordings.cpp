@@ -74,12 +74,14 @@ TEST_F(Recordings, TheSpeakersFileHoldsItsTonesWhereTheyWerePlayed) {
 
     SF_INFO info{};
     SNDFILE* file = sf_open(path("out.wav").c_str(), SFM_READ, &info);
-    ASSERT_TRUE(file && info.samplerate == 44100);
+    ASSERT_TRUE(file);
+    ASSERT_TRUE(info.samplerate == 44100);
     std::vector<short> samples(static_cast<size_t>(info.frames));
     samples.resize(static_cast<size_t>(sf_readf_short(file, samples.data(), info.frames)));
     sf_close(file);
     // The sweep's 3 s, the device's start before it and the last tone's end after it.
-    EXPECT_TRUE(samples.size() > 3.0 * 44100 && samples.size() < 5.0 * 44100) << samples.size();
+    EXPECT_TRUE(samples.size() > 3.0 * 44100) << samples.size();
+    EXPECT_TRUE(samples.size() < 5.0 * 44100) << samples.size();
     std::vector<double> onsets;  // where sound follows silence, in steps of 10 ms
     for (size_t at = 0, loud = 0; at + 441 <= samples.size(); at += 441) {
         const bool now = std::any_of(&samples[at], &samples[at] + 441, [](short s) { return std::abs(s) > 1000; });
@@ -128,7 +130,8 @@ TEST_F(Recordings, ChecksRefuseUnusableFilesWithTheirCauseAndLeaveNothingBehind)
         EXPECT_EQ(reason.rfind(route + ": " + row.cause, 0), ok ? std::string::npos : 0u) << reason;
     }
     EXPECT_EQ(files(), before);  // nothing made or removed, the existing file as it was
-    EXPECT_TRUE(fs::is_character_file("/dev/full") && fs::is_character_file("/dev/null"));
+    EXPECT_TRUE(fs::is_character_file("/dev/full"));
+    EXPECT_TRUE(fs::is_character_file("/dev/null"));
 }
 
 }  // namespace

@@ -91,7 +91,6 @@ int envInt(const char* name, int fallback) { return std::getenv(name) ? std::ato
     _exit(0);
 }();
 
-using PlatformTest = PlatformFixture;
 
 struct Counted : RefBase {
     ~Counted() override { ++destroyed; }
@@ -99,7 +98,7 @@ struct Counted : RefBase {
     static inline std::atomic<int> destroyed{0}, firstRefs{0};
 };
 
-TEST_F(PlatformTest, LastStrongReferenceDestroysTheObjectOnce) {
+TEST_F(Platform, LastStrongReferenceDestroysTheObjectOnce) {
     Counted* raw = new Counted;
     {
         sp<Counted> a(raw), b(a), c(std::move(b)), d;
@@ -117,7 +116,8 @@ TEST_F(PlatformTest, LastStrongReferenceDestroysTheObjectOnce) {
         EXPECT_EQ(raw->getStrongCount(), 3);
         a.clear();
         d = nullptr;
-        EXPECT_TRUE(Counted::destroyed == 0 && Counted::firstRefs == 1);
+        EXPECT_TRUE(Counted::destroyed == 0);
+        EXPECT_TRUE(Counted::firstRefs == 1);
     }
     EXPECT_EQ(Counted::destroyed, 1);
 }
@@ -133,7 +133,7 @@ struct Loop : Thread {
     std::atomic<status_t> fromInside{OK};
 };
 
-TEST_F(PlatformTest, ThreadLoopsUntilFalseOrRequestExitAndWait) {
+TEST_F(Platform, ThreadLoopsUntilFalseOrRequestExitAndWait) {
     sp<Loop> counted = new Loop(25), forever = new Loop(0), inside = new Loop(-1);
     ASSERT_EQ(counted->run("counted"), OK);
     EXPECT_EQ(counted->join(), OK);
@@ -150,7 +150,7 @@ TEST_F(PlatformTest, ThreadLoopsUntilFalseOrRequestExitAndWait) {
 
 // ---- log ------------------------------------------------------------------------------
 
-TEST_F(PlatformTest, LogWritesOneLinePerCallAsPriorityTagMessageAndCanKeepIt) {
+TEST_F(Platform, LogWritesOneLinePerCallAsPriorityTagMessageAndCanKeepIt) {
     const std::string path = tempPath("format.log"), longTag(1500, 't'), longMsg(5000, 'm');
     setLogTarget(path, 'V');
     test::captureLog(true);  // also kept in memory, with the trailing newlines removed
@@ -175,7 +175,7 @@ TEST_F(PlatformTest, LogWritesOneLinePerCallAsPriorityTagMessageAndCanKeepIt) {
     EXPECT_EQ(test::logLines().size(), 1u);
 }
 
-TEST_F(PlatformTest, LogDestinationAndLevelAreReadFromTheEnvironmentAtTheFirstCall) {
+TEST_F(Platform, LogDestinationAndLevelAreReadFromTheEnvironmentAtTheFirstCall) {
     const std::string file = tempPath("env.log");
     // KORVO_LOG ("F": the file) and KORVO_LOG_LEVEL ("": unset); the priorities on stderr and
     // in the file, which each process appends to.
@@ -203,7 +203,7 @@ sp<AudioRecord> makeRecord(size_t frames = 1024, status_t expected = OK) {
     return r;
 }
 
-TEST_F(PlatformTest, RecordSetRulesAndTheScriptedMicrophone) {
+TEST_F(Platform, RecordSetRulesAndTheScriptedMicrophone) {
     sp<AudioRecord> r = makeRecord();
     EXPECT_EQ(r->set(AUDIO_SOURCE_MIC, kRate, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_IN_MONO), INVALID_OPERATION);
     test::setMinFrameCount(300);  // frame count 0 asks for the minimum
@@ -236,7 +236,7 @@ TEST_F(PlatformTest, RecordSetRulesAndTheScriptedMicrophone) {
     EXPECT_EQ(r->read(buf.data(), 8), NO_INIT);
 }
 
-TEST_F(PlatformTest, BlockedReadReturnsWithItsSamplesOrOnStop) {
+TEST_F(Platform, BlockedReadReturnsWithItsSamplesOrOnStop) {
     test::scriptMic(true);
     bool scripted = true;
     sp<AudioRecord> r = makeRecord();
@@ -263,7 +263,9 @@ TEST_F(PlatformTest, BlockedReadReturnsWithItsSamplesOrOnStop) {
     auto paced = blockedRead(2 * kRate);
     r->stop();
     const ssize_t got = paced.get();
-    EXPECT_TRUE(got >= 0 && got < ssize_t(2 * kRate) && std::count(buf.begin(), buf.begin() + got / 2, 0) == got / 2);
+    ASSERT_TRUE(got >= 0);
+    EXPECT_TRUE(got < ssize_t(2 * kRate));
+    EXPECT_TRUE(std::count(buf.begin(), buf.begin() + got / 2, 0) == got / 2);
 }
 
 // ---- output track ---------------------------------------------------------------------
@@ -308,7 +310,7 @@ sp<AudioTrack> makeTrack(Probe& p, status_t expected = OK) {
     return t;
 }
 
-TEST_F(PlatformTest, TrackSetRulesAndForcedFailures) {
+TEST_F(Platform, TrackSetRulesAndForcedFailures) {
     Probe p;
     sp<AudioTrack> t = makeTrack(p);
     EXPECT_EQ(t->set(AUDIO_STREAM_MUSIC, 0, AUDIO_FORMAT_PCM_16_BIT, AUDIO_CHANNEL_OUT_MONO), INVALID_OPERATION);
@@ -331,7 +333,7 @@ TEST_F(PlatformTest, TrackSetRulesAndForcedFailures) {
     EXPECT_EQ(makeTrack(p, BAD_VALUE)->start(), BAD_VALUE);
 }
 
-TEST_F(PlatformTest, TrackCallbackThreadIsPacedAndStops) {
+TEST_F(Platform, TrackCallbackThreadIsPacedAndStops) {
     Probe p;
     std::mutex gate;  // outlives the track and its thread
     p.stopAt = 12;
@@ -354,7 +356,7 @@ TEST_F(PlatformTest, TrackCallbackThreadIsPacedAndStops) {
     held.unlock();
 }
 
-TEST_F(PlatformTest, PumpedSamplesReachTheWavSpeakerAndTheWavMicrophonePlaysThemBack) {
+TEST_F(Platform, PumpedSamplesReachTheWavSpeakerAndTheWavMicrophonePlaysThemBack) {
     const std::string path = tempPath("round-trip.wav");
     test::manualTrackCallbacks(true);
     {
@@ -376,7 +378,9 @@ TEST_F(PlatformTest, PumpedSamplesReachTheWavSpeakerAndTheWavMicrophonePlaysThem
     int rate = 0;
     const Samples file = readWav(path, &rate);
     const auto sound = [](Samples x) { return x.erase(std::remove(x.begin(), x.end(), 0), x.end()), x; };
-    EXPECT_TRUE(file.size() >= written.size() && file.size() < written.size() + 3000 && sound(file) == sound(written));
+    EXPECT_TRUE(file.size() >= written.size());
+    EXPECT_TRUE(file.size() < written.size() + 3000);
+    EXPECT_TRUE(sound(file) == sound(written));
     EXPECT_EQ(rate, 44100);
     setenv("KORVO_MIC", ("wav:" + path).c_str(), 1);
     sp<AudioRecord> r = makeRecord();
@@ -407,7 +411,7 @@ std::map<int, size_t> histogram(const Samples& x) {
     return counts;
 }
 
-TEST_F(PlatformTest, RouteTextsAreCheckedWithAOneLineReason) {
+TEST_F(Platform, RouteTextsAreCheckedWithAOneLineReason) {
     for (const char* good : {"null", "wav:/tmp/x.wav", "wav:x.wav", "sim:Az09._-", "card", "card:0"})
         EXPECT_TRUE(validateRoute(good, nullptr)) << good;
     const std::string bad[] = {"", "NULL", " null", "nul", "wav", "wav:", "sim:", "card:", "speaker", "sim:a/b",
@@ -415,11 +419,12 @@ TEST_F(PlatformTest, RouteTextsAreCheckedWithAOneLineReason) {
     for (const std::string& text : bad) {
         std::string error;
         EXPECT_FALSE(validateRoute(text, &error)) << text;
-        EXPECT_TRUE(!error.empty() && error.find('\n') == std::string::npos) << error;
+        EXPECT_TRUE(!error.empty()) << error;
+        EXPECT_TRUE(error.find('\n') == std::string::npos) << error;
     }
 }
 
-TEST_F(PlatformTest, EveryRouteKeepsRealTimePace) {
+TEST_F(Platform, EveryRouteKeepsRealTimePace) {
     for (const std::string& text : {std::string("null"), "wav:" + tempPath("paced.wav"), "sim:" + uniqueRoom("pace")}) {
         auto out = makeOutputRoute(text, nullptr);
         auto t0 = Clock::now();
@@ -439,7 +444,7 @@ TEST_F(PlatformTest, EveryRouteKeepsRealTimePace) {
     }
 }
 
-TEST_F(PlatformTest, TwoProcessesInOneRoomHearEachOther) {
+TEST_F(Platform, TwoProcessesInOneRoomHearEachOther) {
     for (const char* gain : {"", "-6"}) {
         SCOPED_TRACE(gain);
         const std::string room = uniqueRoom("two"), file = tempPath(room + ".raw");
@@ -461,12 +466,14 @@ TEST_F(PlatformTest, TwoProcessesInOneRoomHearEachOther) {
     }
 }
 
-TEST_F(PlatformTest, RoomSpeakersAreMixedAndClippedTo16Bits) {
+TEST_F(Platform, RoomSpeakersAreMixedAndClippedTo16Bits) {
     for (const int sign : {1, -1}) {
         const std::string room = "sim:" + uniqueRoom("mix");
         auto in = makeCaptureRoute(room, nullptr);
         auto s1 = makeOutputRoute(room, nullptr), s2 = makeOutputRoute(room, nullptr);
-        ASSERT_TRUE(in->open(kRate) == 0 && s1->open(kRate) == 0 && s2->open(kRate) == 0);
+        ASSERT_TRUE(in->open(kRate) == 0);
+        ASSERT_TRUE(s1->open(kRate) == 0);
+        ASSERT_TRUE(s2->open(kRate) == 0);
         std::thread p1([&] { play(*s1, sign * 20000, ms(300)); });
         std::thread p2([&] { play(*s2, sign * 15000, ms(300)); });
         auto counts = histogram(record(*in, ms(900)));
@@ -480,7 +487,7 @@ TEST_F(PlatformTest, RoomSpeakersAreMixedAndClippedTo16Bits) {
     }
 }
 
-TEST_F(PlatformTest, WhatDeadProcessesLeftIsReclaimedAndRoomsArePrivate) {
+TEST_F(Platform, WhatDeadProcessesLeftIsReclaimedAndRoomsArePrivate) {
     const std::string room = uniqueRoom("crash"), stale = uniqueRoom("stale"), unborn = uniqueRoom("unborn"),
                       alien = uniqueRoom("alien"), dotted = "." + uniqueRoom("dot");
     auto in = makeCaptureRoute("sim:" + room, nullptr);
@@ -489,8 +496,11 @@ TEST_F(PlatformTest, WhatDeadProcessesLeftIsReclaimedAndRoomsArePrivate) {
                                        {"KORVO_ROOM_MS", "20000"}, {"KORVO_ROOM_READY_MS", "100"}});
     Child member = device("listen", stale, {{"KORVO_ROOM_MS", "20000"}});
     Child hidden = device("listen", dotted, {{"KORVO_ROOM_MS", "20000"}});
-    ASSERT_TRUE(hog.waitReady() && member.waitReady() && hidden.waitReady() && fs::exists(roomFile(stale)) &&
-                fs::exists(roomFile(dotted)));
+    ASSERT_TRUE(hog.waitReady());
+    ASSERT_TRUE(member.waitReady());
+    ASSERT_TRUE(hidden.waitReady());
+    ASSERT_TRUE(fs::exists(roomFile(stale)));
+    ASSERT_TRUE(fs::exists(roomFile(dotted)));
     std::string error;
     EXPECT_EQ(makeOutputRoute("sim:" + room, &error), nullptr);
     EXPECT_NE(error.find("full"), std::string::npos) << error;
@@ -498,13 +508,16 @@ TEST_F(PlatformTest, WhatDeadProcessesLeftIsReclaimedAndRoomsArePrivate) {
     member.kill();
     hidden.kill();
     auto out = makeOutputRoute("sim:" + room, &error);
-    ASSERT_TRUE(out && in->open(kRate) == 0 && out->open(kRate) == 0) << error;
+    ASSERT_TRUE(out) << error;
+    ASSERT_TRUE(in->open(kRate) == 0) << error;
+    ASSERT_TRUE(out->open(kRate) == 0) << error;
     std::thread player([&] { play(*out, 1000, ms(200)); });
     const Samples heard = record(*in, ms(400));
     player.join();
     EXPECT_GE(histogram(heard)[1000], ms(150)) << "a place of the dead speaker is free again";
     const auto last = std::find_if(heard.rbegin(), heard.rend(), [](int16_t v) { return v != 0; });
-    EXPECT_TRUE(last != heard.rend() && *last == 1000) << "in the end only the new speaker sounds";
+    ASSERT_TRUE(last != heard.rend()) << "in the end only the new speaker sounds";
+    EXPECT_TRUE(*last == 1000) << "in the end only the new speaker sounds";
     // Rooms whose maker died before setting them up, or of another layout.
     for (const auto& [name, size] : {std::pair{unborn, 0}, std::pair{alien, 4096}}) {
         std::ofstream(roomFile(name)).close();
@@ -512,7 +525,9 @@ TEST_F(PlatformTest, WhatDeadProcessesLeftIsReclaimedAndRoomsArePrivate) {
     }
     EXPECT_EQ(makeCaptureRoute("sim:" + alien, &error), nullptr);  // joining reclaims abandoned rooms
     EXPECT_NE(error.find("incompatible"), std::string::npos) << error;
-    EXPECT_FALSE(fs::exists(roomFile(stale)) || fs::exists(roomFile(unborn)) || fs::exists(roomFile(dotted)));
+    EXPECT_FALSE(fs::exists(roomFile(stale)));
+    EXPECT_FALSE(fs::exists(roomFile(unborn)));
+    EXPECT_FALSE(fs::exists(roomFile(dotted)));
     EXPECT_TRUE(fs::remove(roomFile(alien))) << "a room of another layout is left alone";
 }
 

@@ -42,4 +42,17 @@ TEST(PluginSymbols, ExportsExactlyTheExternalInterfaceAndFindsThePlatformBesideI
     EXPECT_NE(dynamic.find("libkorvo_platform.so"), std::string::npos) << dynamic;
 }
 
+TEST(PluginSymbols, TheToneTableIsExportedAs512RecordsOf216Bytes) {
+    // A host reads the table through the symbol: its size is the layout hosts rely on.
+    std::istringstream lines(run("nm -D -S --defined-only --format=posix '" KORVO_PLUGIN_PATH "'"));
+    std::string size;
+    for (std::string line; std::getline(lines, line);) {
+        std::istringstream fields(line);
+        std::string name, type, value;
+        fields >> name >> type >> value;
+        if (name == "_ZN7android17MiniToneGenerator16sToneDescriptorsE") fields >> size;
+    }
+    EXPECT_EQ(std::stoul(size.empty() ? "0" : size, nullptr, 16), 512u * 216u);
+}
+
 }  // namespace

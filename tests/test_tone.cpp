@@ -17,7 +17,6 @@ namespace {
 
 using namespace korvo::tonetest;
 using Fields = std::vector<int>;
-using ToneTestCase = ToneTest;
 const Samples kSilence(882, 0);
 
 Fields fields(const Gen& g) { return {g.mA1_Q14, g.mS2_0, g.mS1, g.mS2, g.mAmplitude_Q15}; }
@@ -27,7 +26,7 @@ double closedForm(const Gen& g, unsigned k) {
     return -static_cast<double>(g.mS2_0) * std::sin(w * (k + 1)) / std::sin(w);
 }
 
-TEST_F(ToneTestCase, WaveGenerator) {
+TEST_F(Tone, WaveGenerator) {
     EXPECT_EQ(fields(Gen(44100, 1000, 0.45f)), (Fields{32435, -4543, 0, -4543, 15098}));
     EXPECT_EQ(logOf("MiniToneGenerator"), Strings{"E/WaveGenerator init, mA1_Q14: 32435, mS2_0: -4543, mAmplitude_Q15: 15098"});
     EXPECT_EQ(fields(Gen(44100, 2580, 0.45f)), (Fields{30578, -11499, 0, -11499, 15098}));
@@ -46,7 +45,8 @@ TEST_F(ToneTestCase, WaveGenerator) {
             ASSERT_NEAR(out[k], w.gen.mAmplitude_Q15 * closedForm(w.gen, k) / 32768.0, 48.0) << freq << " Hz, " << k;
             peak = std::max(peak, std::abs(static_cast<int>(out[k])));
         }
-        EXPECT_TRUE(peak >= 14600 && peak <= 14800) << peak;
+        EXPECT_TRUE(peak >= 14600) << peak;
+        EXPECT_TRUE(peak <= 14800) << peak;
     }
     // The fade: amplitude 989462528 - k x 1121839 in Q31, from the seed on a fresh generator.
     RefWave f(44100, 2580);
@@ -89,7 +89,35 @@ void expectEnd(Engine& gen, const Samples& last) {
     EXPECT_FALSE(test::pumpTrack().called);  // a stopped track makes no more callbacks
 }
 
-TEST_F(ToneTestCase, LimitedToneBlockByBlock) {
+TEST_F(Tone, StopCutsAToneThatStartsPlaysOrRestartsOnly) {
+    // A tone starting, playing or restarting is cut to the samples of the time it has run
+    // (1 s here); one already stopping or stopped keeps its end.
+    Engine gen(AUDIO_STREAM_MUSIC, 0.8f, false);
+    for (const uint16_t state : {Engine::TONE_STARTING, Engine::TONE_PLAYING, Engine::TONE_RESTARTING,
+                                 Engine::TONE_STOPPING, Engine::TONE_STOPPED}) {
+        pthread_mutex_lock(&gen.mLock);
+        clock_gettime(CLOCK_MONOTONIC, &gen.mStartTime);
+        gen.mStartTime.tv_sec -= 1;
+        gen.mMaxSmp = 12345;
+        gen.mState.store(state, std::memory_order_relaxed);
+        pthread_mutex_unlock(&gen.mLock);
+        auto stopped = stopAsync(gen);
+        const uint32_t maxSmp = locked(gen, &Engine::mMaxSmp);
+        pthread_mutex_lock(&gen.mLock);  // stopTone waits for a callback: this is it
+        pthread_cond_signal(&gen.mWaitCbkCond);
+        pthread_mutex_unlock(&gen.mLock);
+        ASSERT_TRUE(ready(stopped)) << "state " << state;
+        if (state == Engine::TONE_STOPPING || state == Engine::TONE_STOPPED) {
+            EXPECT_EQ(maxSmp, 12345u) << "state " << state;
+        } else {
+            EXPECT_GE(maxSmp, 44100u) << "state " << state;
+            EXPECT_LT(maxSmp, 2 * 44100u) << "state " << state;
+        }
+        gen.mState.store(Engine::TONE_INIT, std::memory_order_relaxed);
+    }
+}
+
+TEST_F(Tone, LimitedToneBlockByBlock) {
     Engine gen(AUDIO_STREAM_MUSIC, 0.8f, false);
     RefWave ref(44100, 2580);
     // 100 ms = 4410 samples: blocks 1 to 5 play, block 6 (5292) fades out.
@@ -97,7 +125,8 @@ TEST_F(ToneTestCase, LimitedToneBlockByBlock) {
     ASSERT_TRUE(startAndPump(gen, 0, 100, &p));
     EXPECT_EQ(p.samples, ref.block(882, START));
     EXPECT_EQ(p.sizeBytes, 1764u);
-    EXPECT_TRUE(locked(gen, &Engine::mMaxSmp) == 4410u && locked(gen, &Engine::mNextSegSmp) == kInf);
+    EXPECT_TRUE(locked(gen, &Engine::mMaxSmp) == 4410u);
+    EXPECT_TRUE(locked(gen, &Engine::mNextSegSmp) == kInf);
     EXPECT_TRUE(inOrder(toneLog(), {"startTone", "Clearing mWaveGens:", "prepareWave, duration limited to 100 ms",
                                     "Immediate start, time *", "Wait for start callback", "Starting Cbk",
                                     "Cbk starting track", "Tone started, time *"}));
@@ -122,7 +151,7 @@ TEST_F(ToneTestCase, LimitedToneBlockByBlock) {
     EXPECT_TRUE(pumped(gen, Engine::TONE_INIT, kSilence, {"Stopped Cbk", "Cbk Stopped track"}, 0));
 }
 
-TEST_F(ToneTestCase, SegmentsAndLoops) {
+TEST_F(Tone, SegmentsAndLoops) {
     // On 100 ms of one frequency, then 100 ms of another: in block 6 the first fades out
     // and the second starts on the same samples, both generators alive.
     {
@@ -184,7 +213,7 @@ TEST_F(ToneTestCase, SegmentsAndLoops) {
     expectEnd(gen, kSilence);
 }
 
-TEST_F(ToneTestCase, BlocksRatesAndPrepareWave) {
+TEST_F(Tone, BlocksRatesAndPrepareWave) {
     // A 20 ms limit shows the block layout in the fade: a remainder under two blocks is one block.
     const std::pair<size_t, std::vector<std::pair<unsigned, unsigned>>> cases[] = {
         {1000, {{1000, STOP}}}, {1763, {{1763, STOP}}}, {1764, {{882, START}, {882, STOP}}}, {2000, {{882, START}, {1118, STOP}}}};
@@ -209,7 +238,8 @@ TEST_F(ToneTestCase, BlocksRatesAndPrepareWave) {
     EXPECT_TRUE(gen.prepareWave());
     EXPECT_EQ((std::vector<unsigned>{gen.numWaves(0), gen.numWaves(1), gen.numWaves(2), gen.numWaves(3)}),
               (std::vector<unsigned>{3, 2, 4, 0}));
-    EXPECT_TRUE(gen.mMaxSmp == 11025u && gen.mNextSegSmp == 1323u);
+    EXPECT_TRUE(gen.mMaxSmp == 11025u);
+    EXPECT_TRUE(gen.mNextSegSmp == 1323u);
     // One generator per frequency, made with the gain of its first segment.
     EXPECT_EQ(gen.mWaveGens.size(), 5u);
     EXPECT_EQ(gen.mWaveGens.valueFor(2000)->mAmplitude_Q15, 10065);
@@ -223,11 +253,13 @@ TEST_F(ToneTestCase, BlocksRatesAndPrepareWave) {
     pthread_mutex_unlock(&gen.mLock);
 }
 
-TEST_F(ToneTestCase, EngineStartsStopsAndRestarts) {
+TEST_F(Tone, EngineStartsStopsAndRestarts) {
     {
         Engine gen(AUDIO_STREAM_MUSIC, 0.8f, false);
         EXPECT_EQ(stateOf(gen), Engine::TONE_INIT);
-        EXPECT_TRUE(gen.mSamplingRate == 44100u && gen.mProcessSize == 882u && gen.getMaxToneIndex() == 39);
+        EXPECT_TRUE(gen.mSamplingRate == 44100u);
+        EXPECT_TRUE(gen.mProcessSize == 882u);
+        EXPECT_TRUE(gen.getMaxToneIndex() == 39);
         EXPECT_FLOAT_EQ(gen.mpAudioTrack->getVolume(), 0.8f);
         EXPECT_EQ(Engine::sToneDescriptors[1].segments[0].waveFreq[0], 3440);
         EXPECT_TRUE(inOrder(logOf("MiniToneGenerator"), {"E/MiniToneGenerator constructor: streamType=3, volume=0.800000",
@@ -274,10 +306,12 @@ TEST_F(ToneTestCase, EngineStartsStopsAndRestarts) {
     pthread_mutex_unlock(&gen.mLock);
     auto stopped = stopAsync(gen);
     const uint32_t maxSmp = locked(gen, &Engine::mMaxSmp);
-    EXPECT_TRUE(maxSmp >= 66150u && maxSmp < 66150u + 44100u) << maxSmp;
+    EXPECT_TRUE(maxSmp >= 66150u) << maxSmp;
+    EXPECT_TRUE(maxSmp < 66150u + 44100u) << maxSmp;
     for (int blocks = 0; stateOf(gen) == Engine::TONE_PLAYING && blocks < 200; ++blocks) test::pumpTrack();
     EXPECT_EQ(stateOf(gen), Engine::TONE_STOPPED);
-    EXPECT_TRUE(locked(gen, &Engine::mTotalSmp) > maxSmp && locked(gen, &Engine::mTotalSmp) - 882 <= maxSmp);
+    EXPECT_TRUE(locked(gen, &Engine::mTotalSmp) > maxSmp);
+    EXPECT_TRUE(locked(gen, &Engine::mTotalSmp) - 882 <= maxSmp);
     EXPECT_FALSE(ready(stopped, 0));
     test::pumpTrack();
     ASSERT_TRUE(ready(stopped));
@@ -308,7 +342,7 @@ TEST_F(ToneTestCase, EngineStartsStopsAndRestarts) {
     drain(gen);
 }
 
-TEST_F(ToneTestCase, EngineFailures) {
+TEST_F(Tone, EngineFailures) {
     // set() fails: NO_INIT keeps the track for the next start to replace; any other status
     // shows in initCheck, which releases it. Each recovers once the platform does.
     const struct { void (*fail)(android::status_t); android::status_t status; uint16_t state; const char* line; } cases[] = {
@@ -349,13 +383,17 @@ TEST_F(ToneTestCase, EngineFailures) {
     test::failOutputSamplingRate(android::NO_INIT);
     Engine late(AUDIO_STREAM_VOICE_CALL, 0.5f, true);
     EXPECT_EQ(toneLog(), (Strings{"MiniToneGenerator constructor: streamType=0, volume=0.500000", "Unable to marshal AudioFlinger"}));
-    EXPECT_TRUE(stateOf(late) == Engine::TONE_IDLE && late.mpAudioTrack == nullptr && late.mProcessSize == 0u);
+    EXPECT_TRUE(stateOf(late) == Engine::TONE_IDLE);
+    EXPECT_TRUE(late.mpAudioTrack == nullptr);
+    EXPECT_TRUE(late.mProcessSize == 0u);
     test::clearLog();
     EXPECT_FALSE(late.startTone(0, 100));
     EXPECT_EQ(toneLog(), Strings{"startTone: output sampling rate unknown, tone refused"});
     test::failOutputSamplingRate(0);
     EXPECT_TRUE(startAndPump(late, 0, 20));
-    EXPECT_TRUE(late.mSamplingRate == 44100u && late.mProcessSize == 882u && late.getMaxToneIndex() == 39);
+    EXPECT_TRUE(late.mSamplingRate == 44100u);
+    EXPECT_TRUE(late.mProcessSize == 882u);
+    EXPECT_TRUE(late.getMaxToneIndex() == 39);
     drain(late);
 
     // Rates above 65535 Hz do not fit the generators: refused with one line, no tone started.
@@ -365,10 +403,12 @@ TEST_F(ToneTestCase, EngineFailures) {
     test::clearLog();
     EXPECT_FALSE(fast.startTone(0, 100));
     EXPECT_EQ(toneLog(), Strings{"startTone: output sampling rate 96000 Hz is above 65535 Hz, tone refused"});
-    EXPECT_TRUE(stateOf(fast) == Engine::TONE_INIT && !test::trackPlaying() && fast.mWaveGens.size() == 0u);
+    EXPECT_TRUE(stateOf(fast) == Engine::TONE_INIT);
+    EXPECT_TRUE(!test::trackPlaying());
+    EXPECT_TRUE(fast.mWaveGens.size() == 0u);
 }
 
-TEST_F(ToneTestCase, TimedWaits) {
+TEST_F(Tone, TimedWaits) {
     const std::string status = ", status " + std::to_string(-ETIMEDOUT);
     // Nobody pumps during the start; before it (0) no tone, (1) a tone plays, (2) one ends by itself.
     const std::pair<int, std::string> cases[] = {
@@ -388,7 +428,9 @@ TEST_F(ToneTestCase, TimedWaits) {
         EXPECT_EQ(logOf("MiniToneGenerator", "Tone start failed!!!").size(), before == 2 ? 0u : 1u);
         if (before == 1) {  // a callback now finds no tone: an empty buffer, nothing changed
             test::clearLog();
-            EXPECT_TRUE(test::pumpTrack().sizeBytes == 0u && toneLog() == Strings{"Extra Cbk"} && stateOf(gen) == Engine::TONE_IDLE);
+            EXPECT_TRUE(test::pumpTrack().sizeBytes == 0u);
+            EXPECT_TRUE(toneLog() == Strings{"Extra Cbk"});
+            EXPECT_TRUE(stateOf(gen) == Engine::TONE_IDLE);
         }
     }
     // Callbacks stop while a tone plays (the real playback thread, paused): the stop times out,
@@ -402,11 +444,13 @@ TEST_F(ToneTestCase, TimedWaits) {
     gen.stopTone();
     EXPECT_EQ(stateOf(gen), Engine::TONE_IDLE);
     EXPECT_TRUE(inOrder(toneLog(), {"stopTone", "waiting cond", "--- Stop timed out", "Clearing mWaveGens:"}));
-    EXPECT_TRUE(test::trackStops() == 1 && !test::trackPlaying() && gen.mWaveGens.size() == 0u);
+    EXPECT_TRUE(test::trackStops() == 1);
+    EXPECT_TRUE(!test::trackPlaying());
+    EXPECT_TRUE(gen.mWaveGens.size() == 0u);
     test::pauseTrackCallbacks(false);
 }
 
-TEST_F(ToneTestCase, ThePlaybackThreadIntoAFile) {
+TEST_F(Tone, ThePlaybackThreadIntoAFile) {
     // A limited tone through the real playback thread into the WAV speaker route.
     const std::string path = "/tmp/korvo_tone_" + std::to_string(getpid()) + ".wav";
     setenv("KORVO_SPEAKER", ("wav:" + path).c_str(), 1);
@@ -422,7 +466,8 @@ TEST_F(ToneTestCase, ThePlaybackThreadIntoAFile) {
         EXPECT_TRUE(gen.startTone(3, -1));
         ASSERT_TRUE(waitFor([&] { return stateOf(gen) == Engine::TONE_PLAYING; }));
         gen.stopTone();
-        EXPECT_TRUE(stateOf(gen) == Engine::TONE_INIT && toneCount("--- Stop timed out") == 0);
+        EXPECT_TRUE(stateOf(gen) == Engine::TONE_INIT);
+        EXPECT_TRUE(toneCount("--- Stop timed out") == 0);
         ASSERT_TRUE(gen.startTone(3, -1));
         gen.clearAudioTrack();  // stops, then joins the thread
         EXPECT_EQ(gen.mpAudioTrack, nullptr);
@@ -435,7 +480,8 @@ TEST_F(ToneTestCase, ThePlaybackThreadIntoAFile) {
     s.resize(static_cast<size_t>(sf_readf_short(f, s.data(), info.frames)));
     sf_close(f);
     std::remove(path.c_str());
-    EXPECT_TRUE(info.samplerate == 44100 && info.channels == 1);
+    EXPECT_TRUE(info.samplerate == 44100);
+    EXPECT_TRUE(info.channels == 1);
     // 200 ms: a start block, nine continued blocks and a fade-out block of 3440 Hz, then silence.
     RefWave ref(44100, 3440);
     Samples want = ref.block(882, START);

@@ -5,7 +5,7 @@
 
 #include <utils/Timers.h>
 
-#include "interface/LogTags.h"
+#include "common/LogTags.h"
 
 namespace android {
 

@@ -27,7 +27,7 @@ Layout layOut(const Point& p, int tones, std::mt19937_64& random) {
     Layout l;
     std::uniform_real_distribution<double> u(0.0, 1.0);
     l.toneSamples = static_cast<int64_t>(p.toneMs * kRate / 1000.0);
-    int64_t at = (host::kWarmUpSteps + host::kAutoCalibrationSteps) * kFrame + static_cast<int64_t>(0.3 * kRate);
+    int64_t at = (korvo::kWarmUpSteps + host::kAutoCalibrationSteps) * kFrame + static_cast<int64_t>(0.3 * kRate);
     for (int i = 0; i < tones; ++i) {
         at += static_cast<int64_t>(u(random) * kFrame);
         l.starts.push_back(at);

@@ -27,7 +27,7 @@ Trial runTrial(const Point& p, int code, int level, uint64_t seed) {
     spec.hz = korvo::codeHz(code);
     spec.phase = 2.0 * 3.14159265358979323846 * u(random);
     spec.noiseDbfs = noiseDbfsAt(p.snrDb);
-    spec.toneStart = host::kWarmUpSteps * kFrame + static_cast<int64_t>((0.2 + 0.1 * u(random)) * kRate);
+    spec.toneStart = korvo::kWarmUpSteps * kFrame + static_cast<int64_t>((0.2 + 0.1 * u(random)) * kRate);
     spec.toneEnd = spec.toneStart + static_cast<int64_t>(p.toneMs * kRate / 1000.0);
     const int64_t end = spec.toneEnd + static_cast<int64_t>(0.3 * kRate);
     Trial t;

@@ -17,6 +17,7 @@
 #include <cstring>
 #include <string>
 
+#include <SoundMeterConstants.h>
 #include <SoundMeter_vir.h>
 
 #ifndef KORVO_SOUNDMETER_PLUGIN
@@ -27,10 +28,8 @@ namespace {
 
 constexpr int kCode = 3;                  // the speaker's code; the answer is kCode + 1
 constexpr int kToneMs = 300;
-constexpr int kWarmUpSteps = 13;          // capture steps until the ring holds real sound
 constexpr long kReadyDeadlineMs = 10000;  // the listener's start-up
 constexpr long kHearDeadlineMs = 5000;    // from the moment the code can be said
-constexpr long kToneTailMs = 250;         // fade-out and the room's latency after a tone
 constexpr unsigned kDeviceLimitS = 60;    // a device stuck in the plug-in ends here
 
 const char* gWho = "embed";  // this process, as its lines name it
@@ -81,7 +80,7 @@ bool runListener(SoundMeter_vir* meter, int readyFd) {
     const long said = nowMs();
     say(meter, kCode + 1);
     // Keep capturing while the answer sounds: tearing down now would cut it off.
-    while (nowMs() < said + kToneMs + kToneTailMs) meter->processAudio();
+    while (nowMs() < said + kToneMs + korvo::kToneTailMs) meter->processAudio();
     return true;
 }
 
@@ -143,7 +142,7 @@ int runDevice(bool speaker, const std::string& room, int readyFd) {
     meter->setNeedAck(true);
     // The capture ring starts with stale memory: until it holds captured sound, a
     // read-out can show a code nobody said.
-    for (int i = 0; i < kWarmUpSteps; ++i) meter->processAudio();
+    for (int i = 0; i < korvo::kWarmUpSteps; ++i) meter->processAudio();
     report(stdout, "meter up in room %s", room.c_str());
 
     const bool done = speaker ? runSpeaker(meter, readyFd) : runListener(meter, readyFd);

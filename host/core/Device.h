@@ -10,14 +10,12 @@
 #include "host/core/Plugin.h"
 #include "host/core/RouteGuard.h"
 #include "host/hearing/StepClock.h"
+#include "interface/SoundMeterConstants.h"
 #include "interface/SoundMeter_vir.h"
 
 namespace korvo {
 namespace host {
 
-// Time a tone needs after its duration to be out of the room: the fade-out block
-// (20 ms), the route's latency and some slack for a loaded machine.
-constexpr int kToneTailMs = 250;
 
 struct DeviceSettings {
     int role = 0;           // 1 listener, 2 speaker, 3 both

@@ -4,6 +4,7 @@
 #include <string>
 
 #include "host/hearing/Decoder.h"
+#include "host/hearing/LevelPower.h"
 
 namespace CLI {
 class App;
@@ -30,10 +31,6 @@ struct Command {
     CLI::App* app = nullptr;
     Action action;
 };
-
-// Detection levels, the same range in every command (level 100 = full scale, 1 unit = 1.2 dB).
-constexpr int kMinLevel = -100;
-constexpr int kMaxLevel = 200;
 
 // --level as given: a number, "auto" (calibrate on the room first), or nothing (the
 // plug-in's own level stays).

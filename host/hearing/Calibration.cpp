@@ -62,12 +62,12 @@ Calibration::Proposal Calibration::propose(DecoderKind kind) const {
     p.noiseLevel = room[room.size() / 2];
     if (kind == DecoderKind::Host) {
         const int floorLevel = static_cast<int>(std::floor(room[room.size() / 20])) - kFloorMarginLevels;
-        p.level = std::clamp(floorLevel, kOpenLevel, 200);
+        p.level = std::clamp(floorLevel, kOpenLevel, kMaxLevel);
         p.falsePer10k = 0.0;
         return p;
     }
     int level = std::max(kOpenLevel, static_cast<int>(std::ceil(loudestCode)));
-    while (level < 200 && builtinFalsePerStep(level) >= kTargetPerStep) ++level;
+    while (level < kMaxLevel && builtinFalsePerStep(level) >= kTargetPerStep) ++level;
     p.level = level;
     p.falsePer10k = builtinFalsePerStep(level) * 1e4;
     return p;

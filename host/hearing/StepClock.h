@@ -7,10 +7,6 @@
 namespace korvo {
 namespace host {
 
-// Capture steps a device makes before it listens (151 ms): five frames of 11.6 ms fill
-// the ring, and the analysis thread, one frame per 20 ms turn, takes frames that were
-// captured. A count of steps, not a time: a recording loses the same frames live and offline.
-constexpr int kWarmUpSteps = 13;
 // Steps --level auto listens to the room for (1.5 s).
 constexpr int kAutoCalibrationSteps = 129;
 

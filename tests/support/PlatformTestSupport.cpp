@@ -51,7 +51,7 @@ int Child::waitExit(int timeoutMs) {
 const char* const kVariables[] = {"KORVO_MIC",      "KORVO_SPEAKER",   "KORVO_LOG",     "KORVO_LOG_LEVEL",
                                   "KORVO_SIM_GAIN", "KORVO_SIM_NOISE", "KORVO_SIM_SEED"};
 
-void PlatformFixture::SetUp() {
+void Platform::SetUp() {
     test::resetAll();
     for (const char* name : kVariables) {
         if (const char* value = std::getenv(name)) mSavedEnv.emplace_back(name, value);
@@ -59,7 +59,7 @@ void PlatformFixture::SetUp() {
     }
 }
 
-void PlatformFixture::TearDown() {
+void Platform::TearDown() {
     test::resetAll();
     for (const char* name : kVariables) unsetenv(name);
     for (const auto& [name, value] : mSavedEnv) setenv(name.c_str(), value.c_str(), 1);
@@ -67,7 +67,7 @@ void PlatformFixture::TearDown() {
     for (const auto& path : mPaths) unlink(path.c_str());
 }
 
-std::string PlatformFixture::tempPath(const std::string& name) {
+std::string Platform::tempPath(const std::string& name) {
     mPaths.push_back("/tmp/korvo-platform-test-" + std::to_string(getpid()) + "-" + name);
     unlink(mPaths.back().c_str());
     return mPaths.back();

@@ -41,7 +41,7 @@ public:
 
 // Every test starts with the test controls at their defaults and no route, log or room
 // variable set; after it they, the log configuration and the files it named are put back.
-class PlatformFixture : public ::testing::Test {
+class Platform : public ::testing::Test {
 protected:
     void SetUp() override;
     void TearDown() override;

@@ -39,7 +39,7 @@ bool ready(std::future<T>& f, int seconds = 5) {
 }
 
 // Log kept, callbacks pumped by hand.
-class ToneTest : public LoggedTest {
+class Tone : public LoggedTest {
 protected:
     void SetUp() override {
         LoggedTest::SetUp();

@@ -1,10 +1,10 @@
-// The route registry: ROUTE texts, their factories and the routes in force for the process.
+// The route registry: parses ROUTE texts against the backend table and keeps the routes in
+// force for the process.
 #include <korvo/platform/Routes.h>
 
 #include <cstdlib>
 
-#include "routes/RouteFactories.h"
-#include "routes/SimRoomConfig.h"
+#include "routes/RouteBackend.h"
 
 namespace korvo {
 namespace platform {
@@ -16,49 +16,48 @@ namespace {
 
 constexpr uint32_t kDefaultOutputRate = 44100;
 
-enum class RouteKind { Null, Wav, Sim, Card };
-
 struct RouteText {
-    RouteKind kind = RouteKind::Null;
-    std::string arg;  // PATH, ROOM or DEV; empty for null and a bare card
+    const RouteBackend* backend = nullptr;
+    std::string arg;  // what follows the backend's prefix; empty for a bare route
 };
 
-bool startsWith(const std::string& s, const char* prefix, std::string* rest) {
-    const std::string p(prefix);
-    if (s.compare(0, p.size(), p) != 0) return false;
-    *rest = s.substr(p.size());
+bool startsWith(const std::string& s, const std::string& prefix, std::string* rest) {
+    if (s.compare(0, prefix.size(), prefix) != 0) return false;
+    *rest = s.substr(prefix.size());
     return true;
 }
 
+// "null, wav:PATH, sim:ROOM or card[:DEVICE]"
+std::string expectedRoutes() {
+    const auto& backends = routeBackends();
+    std::string list;
+    for (size_t i = 0; i < backends.size(); ++i) {
+        if (i > 0) list += i + 1 == backends.size() ? " or " : ", ";
+        list += backends[i]->usage;
+    }
+    return list;
+}
+
 bool parse(const std::string& route, RouteText* out, std::string* error) {
-    std::string rest;
-    const char* missing = nullptr;
-    if (route == "null") {
-        out->kind = RouteKind::Null;
-    } else if (route == "card") {
-        out->kind = RouteKind::Card;
-    } else if (startsWith(route, "wav:", &rest)) {
-        out->kind = RouteKind::Wav;
-        missing = "a file path (wav:PATH)";
-    } else if (startsWith(route, "sim:", &rest)) {
-        out->kind = RouteKind::Sim;
-        missing = "a room name (sim:ROOM)";
-    } else if (startsWith(route, "card:", &rest)) {
-        out->kind = RouteKind::Card;
-        missing = "a device after 'card:' (or plain card for the default one)";
-    } else {
-        if (error) {
-            *error = "unknown audio route '" + route +
-                     "' (expected null, wav:PATH, sim:ROOM or card[:DEVICE])";
+    for (const RouteBackend* backend : routeBackends()) {
+        std::string rest;
+        if (backend->bare && route == backend->name) {
+            out->backend = backend;
+            out->arg.clear();
+            return true;
         }
-        return false;
+        if (backend->needs && startsWith(route, std::string(backend->name) + ":", &rest)) {
+            if (rest.empty()) {
+                if (error) *error = "audio route '" + route + "' needs " + backend->needs;
+                return false;
+            }
+            out->backend = backend;
+            out->arg = rest;
+            return true;
+        }
     }
-    if (missing && rest.empty()) {
-        if (error) *error = "audio route '" + route + "' needs " + missing;
-        return false;
-    }
-    out->arg = rest;
-    return true;
+    if (error) *error = "unknown audio route '" + route + "' (expected " + expectedRoutes() + ")";
+    return false;
 }
 
 std::string envRoute(const char* name) {
@@ -66,50 +65,28 @@ std::string envRoute(const char* name) {
     return v && v[0] ? std::string(v) : std::string("null");
 }
 
-}  // namespace
-
-std::unique_ptr<CaptureRoute> makeCaptureRoute(const std::string& route, std::string* error) {
-    RouteText t;
-    if (!parse(route, &t, error)) return nullptr;
-    switch (t.kind) {
-        case RouteKind::Null: return makeNullCaptureRoute();
-        case RouteKind::Wav: return makeWavCaptureRoute(t.arg, error);
-        case RouteKind::Sim: return makeSimCaptureRoute(t.arg, error);
-        case RouteKind::Card: return makeCardCaptureRoute(t.arg, error);
-    }
-    return nullptr;
-}
-
-std::unique_ptr<OutputRoute> makeOutputRoute(const std::string& route, std::string* error) {
-    RouteText t;
-    if (!parse(route, &t, error)) return nullptr;
-    switch (t.kind) {
-        case RouteKind::Null: return makeNullOutputRoute();
-        case RouteKind::Wav: return makeWavOutputRoute(t.arg, error);
-        case RouteKind::Sim: return makeSimOutputRoute(t.arg, error);
-        case RouteKind::Card: return makeCardOutputRoute(t.arg, error);
-    }
-    return nullptr;
-}
-
-namespace {
-
 bool checkRoute(const std::string& route, bool speaker, std::string* reason) {
     RouteText t;
     if (!parse(route, &t, reason)) return false;
     std::string cause;
-    bool ok = true;
-    switch (t.kind) {
-        case RouteKind::Null: break;
-        case RouteKind::Wav: ok = speaker ? checkWavOutput(t.arg, &cause) : checkWavCapture(t.arg, &cause); break;
-        case RouteKind::Sim: ok = checkSimRoute(t.arg, speaker, &cause); break;
-        case RouteKind::Card: ok = checkCardRoute(t.arg, !speaker, &cause); break;
-    }
+    const bool ok = t.backend->check(t.arg, speaker, &cause);
     if (!ok && reason) *reason = route + ": " + cause;
     return ok;
 }
 
 }  // namespace
+
+std::unique_ptr<CaptureRoute> makeCaptureRoute(const std::string& route, std::string* error) {
+    RouteText t;
+    if (!parse(route, &t, error)) return nullptr;
+    return t.backend->openCapture(t.arg, error);
+}
+
+std::unique_ptr<OutputRoute> makeOutputRoute(const std::string& route, std::string* error) {
+    RouteText t;
+    if (!parse(route, &t, error)) return nullptr;
+    return t.backend->openOutput(t.arg, error);
+}
 
 bool checkCaptureRoute(const std::string& route, std::string* reason) { return checkRoute(route, false, reason); }
 
@@ -118,9 +95,9 @@ bool checkOutputRoute(const std::string& route, std::string* reason) { return ch
 int routeRoomSpeakers(const std::string& route, const std::vector<pid_t>& ours, std::string* reason) {
     RouteText t;
     if (!parse(route, &t, reason)) return -1;
-    if (t.kind != RouteKind::Sim) return 0;
+    if (!t.backend->roomSpeakers) return 0;
     std::string cause;
-    const int speakers = simRoomSpeakers(t.arg, ours, &cause);
+    const int speakers = t.backend->roomSpeakers(t.arg, ours, &cause);
     if (speakers < 0 && reason) *reason = route + ": " + cause;
     return speakers;
 }
@@ -128,9 +105,9 @@ int routeRoomSpeakers(const std::string& route, const std::vector<pid_t>& ours, 
 bool validateRoute(const std::string& route, std::string* error) {
     RouteText t;
     if (!parse(route, &t, error)) return false;
-    // A room name is checked here too, so that a host refuses it before anything opens.
-    if (t.kind == RouteKind::Sim) return sim::validateRoomName(t.arg, error);
-    return true;
+    // The argument is checked here too (a room name), so that a host refuses it before
+    // anything opens.
+    return t.backend->validate ? t.backend->validate(t.arg, error) : true;
 }
 
 std::string micRoute() { return envRoute("KORVO_MIC"); }
