@@ -19,6 +19,7 @@
 #include <vector>
 
 #include "host/hearing/Decoder.h"
+#include "host/hearing/LevelPower.h"
 
 namespace korvo {
 namespace host {
@@ -26,7 +27,7 @@ namespace host {
 class Calibration {
 public:
     // The level at which a read-out shows every bin: calibration reads at it.
-    static constexpr int kOpenLevel = -100;
+    static constexpr int kOpenLevel = kMinLevel;
     static constexpr double kTargetPerStep = 1e-4;
     static constexpr int kFloorMarginLevels = 5;
     static constexpr int kLocalBins = 6;  // on each side of a code entry's bin
