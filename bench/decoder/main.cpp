@@ -171,7 +171,7 @@ std::string babble(const std::string& dir) {
     return "-m " + mix;
 }
 
-void falseCodes(FrameDecoder& d, double minutes, const std::string& dir) {
+void falseCodes(FrameDecoder& d, double minutes, const std::string& dir, const std::string& only) {
     std::printf("\n== false codes in noise alone, %.0f min of each source over levels -80..-10 dBFS\n", minutes);
     std::printf("%-10s %10s %12s %s\n", "source", "events", "per hour", "codes");
     std::string speech, music;
@@ -195,6 +195,7 @@ void falseCodes(FrameDecoder& d, double minutes, const std::string& dir) {
     };
     const std::vector<double> levels = {-80, -60, -40, -25, -10};
     for (const Source& s : sources) {
+        if (!only.empty() && s.name != only) continue;
         if (s.inputs.empty() || s.inputs == " ") { std::printf("%-10s (missing)\n", s.name.c_str()); continue; }
         const Samples base = sox(s.inputs, s.effects);
         const double r = rms(base);
@@ -320,12 +321,13 @@ void repeats(FrameDecoder& d, int trials) {
 int main(int argc, char** argv) {
     double minutes = 60;
     int trials = 20;
-    std::string only;
+    std::string only, source;
     for (int i = 1; i + 1 < argc; i += 2) {
         const std::string a = argv[i];
         if (a == "--minutes") minutes = std::atof(argv[i + 1]);
         else if (a == "--trials") trials = std::atoi(argv[i + 1]);
         else if (a == "--only") only = argv[i + 1];
+        else if (a == "--source") source = argv[i + 1];
     }
     char dirTemplate[] = "/tmp/korvo-decoder-eval-XXXXXX";
     const std::string dir = mkdtemp(dirTemplate);
@@ -336,7 +338,7 @@ int main(int argc, char** argv) {
     if (want("distortion")) distortions(d, dir);
     if (want("reverb")) reverb(d, dir);
     if (want("detection")) detection(d, trials);
-    if (want("false")) falseCodes(d, minutes, dir);
+    if (want("false")) falseCodes(d, minutes, dir, source);
     std::filesystem::remove_all(dir);
     return 0;
 }

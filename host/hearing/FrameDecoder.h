@@ -10,8 +10,8 @@
 // see SpectrumWindow); the threshold is the factor that noise alone passes with chance
 // 1e-9 per code and frame, shared among the windows and the range's bins. A peak is a
 // code only when it lies nearest that code's frequency, is no harmonic (of a line down to 80 Hz, the
-// first 40 folded back at half the rate too) of a stronger line sounding with it, and stands as a pure
-// line above the spectrum around it (talk-off).
+// first 40 folded back at half the rate too) of a stronger line sounding with it, read the
+// same frequency a frame earlier, and is the only strong line in the band (talk-off).
 //
 // A code is reported once when it begins and stays sounding while its line holds; after
 // it ends, evidence for the same code may only come from samples after the end, and
@@ -63,6 +63,18 @@ public:
     // must stand kReturnFactor above where such a fade would have left the ended sounding.
     static constexpr double kMaxReverbSeconds = 3.0;
     static constexpr double kReturnFactor = 10.0;  // 10 dB in power: an echo regrows after its dips by less
+    // Talk-off. Windows from 1024 on begin a code only when their previous frame read its
+    // peak within kSteadyBins (recorded speech: 360 false codes an hour without, 0 with);
+    // the one-frame window is exempt, it decides a loud tone's first frame (latency).
+    static constexpr double kSteadyBins = 0.3;
+    // A code's line is the only strong line from kSiblingFromHz up (see pureLine): babble
+    // 984 and music 2,700 false codes an hour without, 0 in 20 minutes of music with.
+    static constexpr double kSiblingFromHz = 300.0;     // hum and rumble below
+    static constexpr double kSiblingDb = 15.0;
+    static constexpr double kSiblingFalseAlarm = 1e-3;  // per window, for a sibling to be a line
+    static constexpr double kStrongSiblingDb = 3.0;
+    static constexpr double kOtherCodeDb = 3.0;         // a line at another code up to this much louder is that code
+    static constexpr int kOwnHarmonics = 10;
 
     FrameDecoder();
     ~FrameDecoder();
@@ -107,18 +119,20 @@ private:
 
     Peak find(int window, int code) const;
     bool harmonicOfStronger(const SpectrumWindow& w, const Peak& p) const;
-    bool pureLine(const SpectrumWindow& w, const Peak& p) const;
+    bool pureLine(int window, const SpectrumWindow& w, const Peak& p) const;
     static double returnLevel(const Track& t);
     bool begins(int code, Track& t);
     void holdOrEnd(int code, Track& t);
 
     std::vector<std::unique_ptr<SpectrumWindow>> mWindows;
     std::array<std::array<Range, kCodes>, kWindows> mRanges{};
+    std::array<double, kWindows> mSiblingFactor{};  // a sibling counts as a line at this factor over its noise
     double mLineFactor = 0.0;  // a fundamental counts as a line at this factor over its noise
     std::vector<float> mHistory;
     int64_t mFrames = 0;
     std::array<Track, kCodes> mTracks{};
     CodeSet mSounding = 0;
+    std::array<std::array<double, kCodes>, kWindows> mLastHz{};  // each window's peak frequency in the previous frame
 };
 
 }  // namespace host
