@@ -14,19 +14,16 @@ namespace {
 constexpr double kRate = korvo::kSampleRate;
 constexpr int kGap = SpectrumWindow::kReferenceGap;
 
-// The code whose nominal frequency is nearest `hz` in ratio, and how far off it is.
+// The code whose nominal frequency is nearest `hz` in ratio, and how far off it is. Codes
+// lie evenly in Hz, so only the two around `hz` are compared (no search: every peak of
+// every window asks).
 int nearestCode(double hz, double* off) {
-    int best = 0;
-    double bestOff = 1e9;
-    for (int c = 0; c < FrameDecoder::kCodes; ++c) {
-        const double o = std::fabs(std::log(hz / korvo::codeHz(c)));
-        if (o < bestOff) {
-            bestOff = o;
-            best = c;
-        }
-    }
-    *off = std::expm1(bestOff);
-    return best;
+    const double step = korvo::codeHz(1) - korvo::codeHz(0);
+    const int below = std::clamp(static_cast<int>(std::floor((hz - korvo::codeHz(0)) / step)), 0, FrameDecoder::kCodes - 2);
+    const double offBelow = std::fabs(std::log(hz / korvo::codeHz(below)));
+    const double offAbove = std::fabs(std::log(hz / korvo::codeHz(below + 1)));
+    *off = std::expm1(std::min(offBelow, offAbove));
+    return offAbove < offBelow ? below + 1 : below;
 }
 
 }  // namespace

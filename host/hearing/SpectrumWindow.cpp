@@ -29,7 +29,7 @@ SpectrumWindow::SpectrumWindow(int length, int referenceCount)
     mIn = fftwf_alloc_real(static_cast<size_t>(length));
     auto* out = fftwf_alloc_complex(static_cast<size_t>(bins()));
     mOut = out;
-    mPlan = fftwf_plan_dft_r2c_1d(length, mIn, out, FFTW_ESTIMATE);
+    mPlan = fftwf_plan_dft_r2c_1d(length, mIn, out, FFTW_MEASURE);
 }
 
 SpectrumWindow::~SpectrumWindow() {
@@ -55,11 +55,19 @@ bool SpectrumWindow::referenceAbove(int bin, int gap) const {
 }
 
 double SpectrumWindow::side(int from, int step) const {
-    std::array<float, kMaxReferenceCount> v{};
-    for (int i = 0; i < mCount; ++i) v[static_cast<size_t>(i)] = power(from + step * i);
-    const int rank = rankOf(mCount);
-    std::nth_element(v.begin(), v.begin() + (rank - 1), v.begin() + mCount);
-    return v[static_cast<size_t>(rank - 1)];
+    // The rank-th smallest is the (count - rank + 1)-th largest: keep the largest few in
+    // order by insertion, cheaper than a selection over the whole set for every peak.
+    const int keep = mCount - rankOf(mCount) + 1;
+    std::array<float, kMaxReferenceCount> top{};
+    int n = 0;
+    for (int i = 0; i < mCount; ++i) {
+        const float v = power(from + step * i);
+        if (n == keep && v <= top[static_cast<size_t>(n - 1)]) continue;
+        int j = n < keep ? n++ : n - 1;
+        for (; j > 0 && top[static_cast<size_t>(j - 1)] < v; --j) top[static_cast<size_t>(j)] = top[static_cast<size_t>(j - 1)];
+        top[static_cast<size_t>(j)] = v;
+    }
+    return top[static_cast<size_t>(keep - 1)];
 }
 
 double SpectrumWindow::noise(int bin, int gap) const {
