@@ -153,7 +153,7 @@ TEST_F(FrameDecoderTest, ThresholdsFollowTheNoiseModel) {
     };
     for (int w : {0, 1, FrameDecoder::kWindows - 1}) {
         for (int c : {0, 22}) {
-            const int count = w == 0 ? FrameDecoder::kShortReferences : FrameDecoder::kReferences;
+            const int count = FrameDecoder::referenceCount(w);
             const double perFrame = falseAlarm(count, count * 3 / 4, mDecoder.threshold(w, c)) * mDecoder.searchBins(w, c) * FrameDecoder::kWindows;
             EXPECT_NEAR(std::log10(perFrame), -9.0, 0.01) << "window " << w << " code " << c;
         }

@@ -30,7 +30,7 @@ int nearestCode(double hz, double* off) {
 
 FrameDecoder::FrameDecoder() : mHistory(static_cast<size_t>(kHistory), 0.0f) {
     for (int w = 0; w < kWindows; ++w) {
-        mWindows.push_back(std::make_unique<SpectrumWindow>(kWindowLengths[static_cast<size_t>(w)], w == 0 ? kShortReferences : kReferences));
+        mWindows.push_back(std::make_unique<SpectrumWindow>(kWindowLengths[static_cast<size_t>(w)], referenceCount(w)));
         const int count = mWindows.back()->referenceCount();
         const int rank = SpectrumWindow::rankOf(count);
         const double binHz = mWindows.back()->binHz();
@@ -182,6 +182,7 @@ bool FrameDecoder::begins(int code, Track& t) {
         // Only samples heard so far, and none from before the code's last end.
         if (win.length() > mFrames * korvo::kFrameSamples) break;
         if (t.sinceEnd >= 0 && win.length() > t.sinceEnd * korvo::kFrameSamples) break;
+        if (!fresh(win.length())) continue;
         const Peak p = find(w, code);
         // Beyond one frame a window shares most samples with its previous frame's: a steady
         // line reads the same frequency there, a voice's gliding harmonic does not.
@@ -227,7 +228,7 @@ CodeSet FrameDecoder::addFrame(const int16_t* samples) {
     ++mFrames;
     for (auto& w : mWindows) {
         if (w->length() > mFrames * n) break;
-        w->analyse(mHistory.data() + (kHistory - w->length()));
+        if (fresh(w->length())) w->analyse(mHistory.data() + (kHistory - w->length()));
     }
     CodeSet began = 0;
     for (int c = 0; c < kCodes; ++c) {
