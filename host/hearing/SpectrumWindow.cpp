@@ -55,19 +55,25 @@ bool SpectrumWindow::referenceAbove(int bin, int gap) const {
 }
 
 double SpectrumWindow::side(int from, int step) const {
-    // The rank-th smallest is the (count - rank + 1)-th largest: keep the largest few in
-    // order by insertion, cheaper than a selection over the whole set for every peak.
-    const int keep = mCount - rankOf(mCount) + 1;
-    std::array<float, kMaxReferenceCount> top{};
+    const int rank = rankOf(mCount);
+    const int keep = mCount - rank + 1;
+    std::array<float, kMaxReferenceCount> v{};
+    if (keep > kInsertionKeep) {
+        for (int i = 0; i < mCount; ++i) v[static_cast<size_t>(i)] = power(from + step * i);
+        std::nth_element(v.begin(), v.begin() + (rank - 1), v.begin() + mCount);
+        return v[static_cast<size_t>(rank - 1)];
+    }
+    // The rank-th smallest is the keep-th largest: with few to keep, keeping the largest
+    // in order by insertion is cheaper than a selection.
     int n = 0;
     for (int i = 0; i < mCount; ++i) {
-        const float v = power(from + step * i);
-        if (n == keep && v <= top[static_cast<size_t>(n - 1)]) continue;
+        const float x = power(from + step * i);
+        if (n == keep && x <= v[static_cast<size_t>(n - 1)]) continue;
         int j = n < keep ? n++ : n - 1;
-        for (; j > 0 && top[static_cast<size_t>(j - 1)] < v; --j) top[static_cast<size_t>(j)] = top[static_cast<size_t>(j - 1)];
-        top[static_cast<size_t>(j)] = v;
+        for (; j > 0 && v[static_cast<size_t>(j - 1)] < x; --j) v[static_cast<size_t>(j)] = v[static_cast<size_t>(j - 1)];
+        v[static_cast<size_t>(j)] = x;
     }
-    return top[static_cast<size_t>(keep - 1)];
+    return v[static_cast<size_t>(keep - 1)];
 }
 
 double SpectrumWindow::noise(int bin, int gap) const {
