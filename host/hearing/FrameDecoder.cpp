@@ -141,8 +141,8 @@ bool FrameDecoder::harmonicOfStronger(const SpectrumWindow& w, const Peak& p) co
 // code's line is the only strong one there, apart from its own weaker harmonics (a
 // loudspeaker's distortion) and weaker lines at other codes (another sender). A sibling
 // counts when it comes within kSiblingDb of the line and is itself a line (noise alone
-// passes kSiblingFactor with chance 1e-3 anywhere in the window), or when it is stronger
-// than the line and stands kStrongSiblingDb over its own noise (dense music hides its
+// passes kSiblingFactor with chance 1e-3 anywhere in the window), or when it is at least
+// half as strong as the line and stands kStrongSiblingDb over its own noise (dense music hides its
 // partials' noise estimate; a code in brown or pink noise is still louder than any bin
 // of it at the SNRs it is heard at).
 bool FrameDecoder::pureLine(int window, const SpectrumWindow& w, const Peak& p) const {
@@ -166,7 +166,7 @@ bool FrameDecoder::pureLine(int window, const SpectrumWindow& w, const Peak& p) 
         nearestCode(hz, &off);
         if (off <= kTolerance && q < otherCode) continue;
         const double noise = w.noise(b, kGap);
-        if (q >= factor * noise || (q >= top && q >= strong * noise)) return false;
+        if (q >= factor * noise || (q >= 0.5 * top && q >= strong * noise)) return false;
     }
     return true;
 }
