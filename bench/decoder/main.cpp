@@ -2,7 +2,8 @@
 // short and faint tones in white noise, latency, false codes in an hour of each noise,
 // wrong codes through distortion, clipping, clock error and reverberation, and repeats.
 // External sound comes from sox, espeak-ng and recordings shipped in Debian packages.
-//   korvo_decoder_eval [--minutes M] [--trials N]
+//   korvo_decoder_eval [--minutes M] [--trials N] [--only latency|repeat|distortion|reverb|detection|false]
+//                      [--source NAME] [--csv FILE]   (false codes: one source; rows appended to FILE)
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
@@ -171,7 +172,17 @@ std::string babble(const std::string& dir) {
     return "-m " + mix;
 }
 
-void falseCodes(FrameDecoder& d, double minutes, const std::string& dir) {
+// 60 s of Gaussian white noise of RMS `level` (full scale 1), from a fixed seed.
+Samples gaussian(double level) {
+    std::mt19937_64 rng(20261125u);
+    std::normal_distribution<double> g(0.0, level * 32768.0);
+    Samples s(static_cast<size_t>(60 * kRate));
+    for (int16_t& v : s) v = static_cast<int16_t>(std::clamp(std::lround(g(rng)), -32768L, 32767L));
+    return s;
+}
+
+// Counts false codes in each source at each level; with `csv`, one row per source and level.
+void falseCodes(FrameDecoder& d, double minutes, const std::string& dir, const std::string& only, const std::string& csv) {
     std::printf("\n== false codes in noise alone, %.0f min of each source over levels -80..-10 dBFS\n", minutes);
     std::printf("%-10s %10s %12s %s\n", "source", "events", "per hour", "codes");
     std::string speech, music;
@@ -185,6 +196,7 @@ void falseCodes(FrameDecoder& d, double minutes, const std::string& dir) {
     const std::string voices = babble(dir);
     struct Source { std::string name, inputs, effects; };
     const std::vector<Source> sources = {
+        {"gaussian", "-n", ""},
         {"white", "-n", "synth 60 whitenoise"},
         {"pink", "-n", "synth 60 pinknoise"},
         {"brown", "-n", "synth 60 brownnoise"},
@@ -195,17 +207,27 @@ void falseCodes(FrameDecoder& d, double minutes, const std::string& dir) {
     };
     const std::vector<double> levels = {-80, -60, -40, -25, -10};
     for (const Source& s : sources) {
+        if (!only.empty() && s.name != only) continue;
         if (s.inputs.empty() || s.inputs == " ") { std::printf("%-10s (missing)\n", s.name.c_str()); continue; }
-        const Samples base = sox(s.inputs, s.effects);
-        const double r = rms(base);
+        const bool own = s.effects.empty();
+        const double r = own ? 1.0 : rms(sox(s.inputs, s.effects));
         std::vector<int> perCode(kCodes, 0);
         int events = 0;
         for (double level : levels) {
             const double v = std::pow(10.0, level / 20.0) / r;
             char gain[64];
             std::snprintf(gain, sizeof gain, " vol %.9f", v);
-            const Samples x = sox(s.inputs, s.effects + gain);
-            events += countEvents(d, x, minutes * 60.0 / static_cast<double>(levels.size()), &perCode);
+            const Samples x = own ? gaussian(std::pow(10.0, level / 20.0)) : sox(s.inputs, s.effects + gain);
+            const double seconds = minutes * 60.0 / static_cast<double>(levels.size());
+            const int atLevel = countEvents(d, x, seconds, &perCode);
+            events += atLevel;
+            if (!csv.empty()) {
+                FILE* out = std::fopen(csv.c_str(), "a");
+                if (out) {
+                    std::fprintf(out, "%s,%.0f,%.1f,%d,%.1f\n", s.name.c_str(), level, seconds / 60.0, atLevel, atLevel * 3600.0 / seconds);
+                    std::fclose(out);
+                }
+            }
         }
         std::string codes;
         for (int c = 0; c < kCodes; ++c) if (perCode[static_cast<size_t>(c)]) codes += std::to_string(c) + "x" + std::to_string(perCode[static_cast<size_t>(c)]) + " ";
@@ -320,12 +342,14 @@ void repeats(FrameDecoder& d, int trials) {
 int main(int argc, char** argv) {
     double minutes = 60;
     int trials = 20;
-    std::string only;
+    std::string only, source, csv;
     for (int i = 1; i + 1 < argc; i += 2) {
         const std::string a = argv[i];
         if (a == "--minutes") minutes = std::atof(argv[i + 1]);
         else if (a == "--trials") trials = std::atoi(argv[i + 1]);
         else if (a == "--only") only = argv[i + 1];
+        else if (a == "--source") source = argv[i + 1];
+        else if (a == "--csv") csv = argv[i + 1];
     }
     char dirTemplate[] = "/tmp/korvo-decoder-eval-XXXXXX";
     const std::string dir = mkdtemp(dirTemplate);
@@ -336,7 +360,7 @@ int main(int argc, char** argv) {
     if (want("distortion")) distortions(d, dir);
     if (want("reverb")) reverb(d, dir);
     if (want("detection")) detection(d, trials);
-    if (want("false")) falseCodes(d, minutes, dir);
+    if (want("false")) falseCodes(d, minutes, dir, source, csv);
     std::filesystem::remove_all(dir);
     return 0;
 }

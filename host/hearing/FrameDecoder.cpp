@@ -14,26 +14,23 @@ namespace {
 constexpr double kRate = korvo::kSampleRate;
 constexpr int kGap = SpectrumWindow::kReferenceGap;
 
-// The code whose nominal frequency is nearest `hz` in ratio, and how far off it is.
+// The code whose nominal frequency is nearest `hz` in ratio, and how far off it is. Codes
+// lie evenly in Hz, so only the two around `hz` are compared (no search: every peak of
+// every window asks).
 int nearestCode(double hz, double* off) {
-    int best = 0;
-    double bestOff = 1e9;
-    for (int c = 0; c < FrameDecoder::kCodes; ++c) {
-        const double o = std::fabs(std::log(hz / korvo::codeHz(c)));
-        if (o < bestOff) {
-            bestOff = o;
-            best = c;
-        }
-    }
-    *off = std::expm1(bestOff);
-    return best;
+    const double step = korvo::codeHz(1) - korvo::codeHz(0);
+    const int below = std::clamp(static_cast<int>(std::floor((hz - korvo::codeHz(0)) / step)), 0, FrameDecoder::kCodes - 2);
+    const double offBelow = std::fabs(std::log(hz / korvo::codeHz(below)));
+    const double offAbove = std::fabs(std::log(hz / korvo::codeHz(below + 1)));
+    *off = std::expm1(std::min(offBelow, offAbove));
+    return offAbove < offBelow ? below + 1 : below;
 }
 
 }  // namespace
 
 FrameDecoder::FrameDecoder() : mHistory(static_cast<size_t>(kHistory), 0.0f) {
     for (int w = 0; w < kWindows; ++w) {
-        mWindows.push_back(std::make_unique<SpectrumWindow>(kWindowLengths[static_cast<size_t>(w)], w == 0 ? kShortReferences : kReferences));
+        mWindows.push_back(std::make_unique<SpectrumWindow>(kWindowLengths[static_cast<size_t>(w)], referenceCount(w)));
         const int count = mWindows.back()->referenceCount();
         const int rank = SpectrumWindow::rankOf(count);
         const double binHz = mWindows.back()->binHz();
@@ -50,7 +47,13 @@ FrameDecoder::FrameDecoder() : mHistory(static_cast<size_t>(kHistory), 0.0f) {
             r.hold = orderStatisticThreshold(count, rank, kHoldFalseAlarm / bins);
         }
     }
+    for (int w = 0; w < kWindows; ++w) {
+        const SpectrumWindow& win = *mWindows[static_cast<size_t>(w)];
+        mSiblingFactor[static_cast<size_t>(w)] =
+            orderStatisticThreshold(win.referenceCount(), SpectrumWindow::rankOf(win.referenceCount()), kSiblingFalseAlarm / win.bins());
+    }
     mLineFactor = orderStatisticThreshold(kShortReferences, SpectrumWindow::rankOf(kShortReferences), kHoldFalseAlarm);
+    reset();
 }
 
 FrameDecoder::~FrameDecoder() = default;
@@ -68,6 +71,7 @@ void FrameDecoder::reset() {
     std::fill(mHistory.begin(), mHistory.end(), 0.0f);
     mFrames = 0;
     for (Track& t : mTracks) t = Track{};
+    for (auto& a : mLastHz) a.fill(-1.0);
     mSounding = 0;
 }
 
@@ -132,7 +136,40 @@ bool FrameDecoder::harmonicOfStronger(const SpectrumWindow& w, const Peak& p) co
     return false;
 }
 
-bool FrameDecoder::pureLine(const SpectrumWindow&, const Peak&) const { return true; }
+// Speech and music make lines too, but never alone: voiced speech and every note bring
+// other partials of their fundamental, and chords bring other notes, from 300 Hz up. A
+// code's line is the only strong one there, apart from its own weaker harmonics (a
+// loudspeaker's distortion) and weaker lines at other codes (another sender). A sibling
+// counts when it comes within kSiblingDb of the line and is itself a line (noise alone
+// passes kSiblingFactor with chance 1e-3 anywhere in the window), or when it is at least
+// half as strong as the line and stands kStrongSiblingDb over its own noise (dense music hides its
+// partials' noise estimate; a code in brown or pink noise is still louder than any bin
+// of it at the SNRs it is heard at).
+bool FrameDecoder::pureLine(int window, const SpectrumWindow& w, const Peak& p) const {
+    const double top = w.power(p.bin);
+    const double floor = top * std::pow(10.0, -kSiblingDb / 10.0);
+    const double otherCode = top * std::pow(10.0, kOtherCodeDb / 10.0);
+    const double strong = std::pow(10.0, kStrongSiblingDb / 10.0);
+    const double factor = mSiblingFactor[static_cast<size_t>(window)];
+    for (int b = std::max(static_cast<int>(kSiblingFromHz / w.binHz()), 1); b <= w.bins() - 2; ++b) {
+        const float q = w.power(b);
+        if (q < floor || std::abs(b - p.bin) < kGap || q < w.power(b - 1) || q < w.power(b + 1)) continue;
+        double hz = 0.0, power = 0.0;
+        w.interpolate(b, &hz, &power);
+        if (q < top) {
+            bool own = false;
+            for (int k = 2; k <= kOwnHarmonics && !own; ++k)
+                own = std::fabs(std::fabs(std::remainder(k * p.hz, kRate)) - hz) < (1.5 + 0.1 * k) * w.binHz();
+            if (own) continue;
+        }
+        double off = 0.0;
+        nearestCode(hz, &off);
+        if (off <= kTolerance && q < otherCode) continue;
+        const double noise = w.noise(b, kGap);
+        if (q >= factor * noise || (q >= 0.5 * top && q >= strong * noise)) return false;
+    }
+    return true;
+}
 
 double FrameDecoder::returnLevel(const Track& t) {
     const double seconds = static_cast<double>(t.sinceEnd * korvo::kFrameSamples) / kRate;
@@ -145,10 +182,17 @@ bool FrameDecoder::begins(int code, Track& t) {
         // Only samples heard so far, and none from before the code's last end.
         if (win.length() > mFrames * korvo::kFrameSamples) break;
         if (t.sinceEnd >= 0 && win.length() > t.sinceEnd * korvo::kFrameSamples) break;
+        if (!fresh(win.length())) continue;
         const Peak p = find(w, code);
+        // Beyond one frame a window shares most samples with its previous frame's: a steady
+        // line reads the same frequency there, a voice's gliding harmonic does not.
+        double& last = mLastHz[static_cast<size_t>(w)][static_cast<size_t>(code)];
+        const double before = last;
+        last = p.bin < 0 ? -1.0 : p.hz;
+        if (w > 0 && std::fabs(p.hz - before) > kSteadyBins * win.binHz()) continue;
         if (p.bin < 0 || p.ratio < mRanges[static_cast<size_t>(w)][static_cast<size_t>(code)].start) continue;
         if (t.sinceEnd >= 0 && p.power < returnLevel(t)) continue;
-        if (harmonicOfStronger(win, p) || !pureLine(win, p)) continue;
+        if (harmonicOfStronger(win, p) || !pureLine(w, win, p)) continue;
         t.sounding = true;
         t.holdWindows = std::max(w + 1, 2);
         t.misses = 0;
@@ -184,7 +228,7 @@ CodeSet FrameDecoder::addFrame(const int16_t* samples) {
     ++mFrames;
     for (auto& w : mWindows) {
         if (w->length() > mFrames * n) break;
-        w->analyse(mHistory.data() + (kHistory - w->length()));
+        if (fresh(w->length())) w->analyse(mHistory.data() + (kHistory - w->length()));
     }
     CodeSet began = 0;
     for (int c = 0; c < kCodes; ++c) {

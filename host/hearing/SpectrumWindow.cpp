@@ -29,7 +29,7 @@ SpectrumWindow::SpectrumWindow(int length, int referenceCount)
     mIn = fftwf_alloc_real(static_cast<size_t>(length));
     auto* out = fftwf_alloc_complex(static_cast<size_t>(bins()));
     mOut = out;
-    mPlan = fftwf_plan_dft_r2c_1d(length, mIn, out, FFTW_ESTIMATE);
+    mPlan = fftwf_plan_dft_r2c_1d(length, mIn, out, FFTW_MEASURE);
 }
 
 SpectrumWindow::~SpectrumWindow() {
@@ -55,11 +55,25 @@ bool SpectrumWindow::referenceAbove(int bin, int gap) const {
 }
 
 double SpectrumWindow::side(int from, int step) const {
-    std::array<float, kMaxReferenceCount> v{};
-    for (int i = 0; i < mCount; ++i) v[static_cast<size_t>(i)] = power(from + step * i);
     const int rank = rankOf(mCount);
-    std::nth_element(v.begin(), v.begin() + (rank - 1), v.begin() + mCount);
-    return v[static_cast<size_t>(rank - 1)];
+    const int keep = mCount - rank + 1;
+    std::array<float, kMaxReferenceCount> v{};
+    if (keep > kInsertionKeep) {
+        for (int i = 0; i < mCount; ++i) v[static_cast<size_t>(i)] = power(from + step * i);
+        std::nth_element(v.begin(), v.begin() + (rank - 1), v.begin() + mCount);
+        return v[static_cast<size_t>(rank - 1)];
+    }
+    // The rank-th smallest is the keep-th largest: with few to keep, keeping the largest
+    // in order by insertion is cheaper than a selection.
+    int n = 0;
+    for (int i = 0; i < mCount; ++i) {
+        const float x = power(from + step * i);
+        if (n == keep && x <= v[static_cast<size_t>(n - 1)]) continue;
+        int j = n < keep ? n++ : n - 1;
+        for (; j > 0 && v[static_cast<size_t>(j - 1)] < x; --j) v[static_cast<size_t>(j)] = v[static_cast<size_t>(j - 1)];
+        v[static_cast<size_t>(j)] = x;
+    }
+    return v[static_cast<size_t>(keep - 1)];
 }
 
 double SpectrumWindow::noise(int bin, int gap) const {

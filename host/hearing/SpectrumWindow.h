@@ -16,7 +16,8 @@ public:
     // (bins two apart under Hann are nearly independent, neighbours are not), the nearest
     // kReferenceGap bins away (outside the main lobe of a line at the bin); the estimate is
     // the rank-th smallest, rank = 3/4 of count, so a quarter may hold other lines.
-    static constexpr int kMaxReferenceCount = 32;
+    static constexpr int kMaxReferenceCount = 128;
+    static constexpr int kInsertionKeep = 17;  // up to 64 references
     static constexpr int kReferenceStep = 2;
     static constexpr int kReferenceGap = 3;
     static constexpr int rankOf(int count) { return count * 3 / 4; }
