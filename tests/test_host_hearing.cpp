@@ -155,12 +155,14 @@ TEST_F(HostHearing, EveryCodeInNoiseAsSaidAndNoCodeNobodySaid) {
     ASSERT_EQ(heard.size(), all.size()) << codesOf(heard);
     for (size_t i = 0; i < heard.size(); ++i) {
         EXPECT_EQ(heard[i].code, int(i));
-        // Within 30 ms of the tone's start (a tone 10 dB over the noise in each frame's bin).
-        EXPECT_TRUE(heard[i].seconds > starts[i] && heard[i].seconds < starts[i] + 0.03) << codesOf(heard);
+        // Within a few frames of the tone's start (a tone 10 dB over the noise in each frame's bin).
+        EXPECT_GT(heard[i].seconds, starts[i]) << codesOf(heard);
+        EXPECT_LT(heard[i].seconds, starts[i] + 0.06) << codesOf(heard);
     }
 
-    // Codes 18..23: the host hears 18..22 as themselves, and nobody hears 23, above half the rate.
-    const std::string high = record("high", {{18, 300}, {19, 300}, {20, 300}, {21, 300}, {22, 300}, {23, 300}}, NAN, 2000);
+    // Codes 18..23 over a quiet room's noise: the host hears 18..22 as themselves, and nobody
+    // hears 23, above half the rate.
+    const std::string high = record("high", {{18, 300}, {19, 300}, {20, 300}, {21, 300}, {22, 300}, {23, 300}}, 40.0, 2000);
     std::string codes;
     for (const Heard& h : scan(high)) codes += std::to_string(h.code) + " ";
     EXPECT_EQ(codes, "18 19 20 21 22 ");

@@ -29,7 +29,7 @@ SpectrumWindow::SpectrumWindow(int length, int referenceCount)
     mIn = fftwf_alloc_real(static_cast<size_t>(length));
     auto* out = fftwf_alloc_complex(static_cast<size_t>(bins()));
     mOut = out;
-    mPlan = fftwf_plan_dft_r2c_1d(length, mIn, out, FFTW_MEASURE);
+    mPlan = fftwf_plan_dft_r2c_1d(length, mIn, out, FFTW_ESTIMATE);
 }
 
 SpectrumWindow::~SpectrumWindow() {
@@ -80,8 +80,15 @@ double SpectrumWindow::noise(int bin, int gap) const {
     double n = 0.0;
     if (referenceBelow(bin, gap)) n = side(bin - gap, -kReferenceStep);
     if (referenceAbove(bin, gap)) n = std::max(n, side(bin + gap, kReferenceStep));
-    // Silence (digital zero) still needs a positive estimate.
-    return std::max(n, 1e-20);
+    // Nothing quieter than a converter's own noise counts as the room: under it, a splatter
+    // or a leftover far below anything audible would stand out of digital silence.
+    return std::max(n, quietestNoise());
+}
+
+double SpectrumWindow::quietestNoise() const {
+    // White noise of variance s2 reads 6 s2 / N in a bin of a Hann window of N samples
+    // (powers scaled so that a sine of amplitude A reads A^2).
+    return 6.0 * kQuietestVariance / mLength;
 }
 
 int SpectrumWindow::peak(int lo, int hi) const {

@@ -36,12 +36,19 @@ public:
     double binHz() const { return mBinHz; }
     float power(int bin) const { return mPower[static_cast<size_t>(bin)]; }
 
+    // The quietest noise a room can have: white noise of 2 LSB RMS at 16 bits (-84 dBFS). A
+    // microphone's own noise lies above it; below it lie only a converter's silence and
+    // its rounding.
+    static constexpr double kQuietestVariance = 4.0 / (32768.0 * 32768.0);
+    double quietestNoise() const;
+
     // Whether a noise estimate can be made at `bin` from below / from above.
     bool referenceBelow(int bin, int gap) const;
     bool referenceAbove(int bin, int gap) const;
     // The noise power at `bin`: on each side with room, the kReferenceRank-th smallest of
     // its reference bins (from `gap` bins away), and the louder side of the two, so a
-    // sloped spectrum never reads quieter than the side it rises towards.
+    // sloped spectrum never reads quieter than the side it rises towards; never under
+    // quietestNoise().
     double noise(int bin, int gap) const;
 
     // The largest power in [lo, hi] at a local maximum (not below either neighbour):
