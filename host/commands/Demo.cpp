@@ -78,7 +78,7 @@ public:
             noise = text;
         }
         const std::string where = freshRoom ? "in room " + mRoom : "on mic " + mMic + ", speaker " + mSpeaker;
-        infof("demo %s: %s, acknowledgement %s, tones of %d ms, %s, %s decision%s\n", where.c_str(),
+        infof("demo %s: %s, acknowledgement %s, tones of %d ms, %s, %s decision%s\n", shown(where).c_str(),
               plural(mOpt.rounds, "round").c_str(), mOpt.noAck ? "off" : "on", mOpt.toneMs, noise.c_str(),
               decoderName(mOpt.decoder), levelArgument().empty() ? "" : (", " + levelArgument().substr(2)).c_str());
 

@@ -57,7 +57,7 @@ int finish(const Spectrogram& picture, const PictureTitle& title, const std::str
         return 1;
     }
     resultf(JsonEvent("picture").add("png", png).add("audio_s", title.seconds).add("codes", count),
-            "wrote %s: %.1f s of %s, %s heard\n", png.c_str(), title.seconds, title.source.c_str(),
+            "wrote %s: %.1f s of %s, %s heard\n", shown(png).c_str(), title.seconds, shown(title.source).c_str(),
             plural(count, "code").c_str());
     return 0;
 }
