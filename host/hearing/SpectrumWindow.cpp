@@ -29,7 +29,7 @@ SpectrumWindow::SpectrumWindow(int length, int referenceCount)
     mIn = fftwf_alloc_real(static_cast<size_t>(length));
     auto* out = fftwf_alloc_complex(static_cast<size_t>(bins()));
     mOut = out;
-    mPlan = fftwf_plan_dft_r2c_1d(length, mIn, out, FFTW_MEASURE);
+    mPlan = fftwf_plan_dft_r2c_1d(length, mIn, out, FFTW_ESTIMATE);
 }
 
 SpectrumWindow::~SpectrumWindow() {
@@ -81,6 +81,19 @@ double SpectrumWindow::noise(int bin, int gap) const {
     if (referenceBelow(bin, gap)) n = side(bin - gap, -kReferenceStep);
     if (referenceAbove(bin, gap)) n = std::max(n, side(bin + gap, kReferenceStep));
     // Silence (digital zero) still needs a positive estimate.
+    return std::max(n, 1e-20);
+}
+
+double SpectrumWindow::noiseBound(int bin, int gap) const {
+    const int keep = mCount - rankOf(mCount) + 1;
+    auto least = [&](int from, int step) {
+        float m = power(from);
+        for (int i = 1; i < keep; ++i) m = std::min(m, power(from + step * i));
+        return static_cast<double>(m);
+    };
+    double n = 0.0;
+    if (referenceBelow(bin, gap)) n = least(bin - gap, -kReferenceStep);
+    if (referenceAbove(bin, gap)) n = std::max(n, least(bin + gap, kReferenceStep));
     return std::max(n, 1e-20);
 }
 
