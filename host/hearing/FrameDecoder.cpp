@@ -83,7 +83,7 @@ void FrameDecoder::levels(float* out256) const {
     }
 }
 
-FrameDecoder::Peak FrameDecoder::find(int window, int code) const {
+FrameDecoder::Peak FrameDecoder::find(int window, int code, double least) const {
     const SpectrumWindow& w = *mWindows[static_cast<size_t>(window)];
     const Range& r = mRanges[static_cast<size_t>(window)][static_cast<size_t>(code)];
     Peak p;
@@ -96,6 +96,9 @@ FrameDecoder::Peak FrameDecoder::find(int window, int code) const {
         p.bin = -1;
         return p;
     }
+    // The exact noise estimate costs most of a frame: a peak below `least` times a lower
+    // bound of it cannot pass, and gets no ratio.
+    if (w.power(p.bin) < least * w.noiseBound(p.bin, kGap)) return p;
     p.ratio = w.power(p.bin) / w.noise(p.bin, kGap);
     return p;
 }
@@ -183,7 +186,7 @@ bool FrameDecoder::begins(int code, Track& t) {
         if (win.length() > mFrames * korvo::kFrameSamples) break;
         if (t.sinceEnd >= 0 && win.length() > t.sinceEnd * korvo::kFrameSamples) break;
         if (!fresh(win.length())) continue;
-        const Peak p = find(w, code);
+        const Peak p = find(w, code, mRanges[static_cast<size_t>(w)][static_cast<size_t>(code)].start);
         // Beyond one frame a window shares most samples with its previous frame's: a steady
         // line reads the same frequency there, a voice's gliding harmonic does not.
         double& last = mLastHz[static_cast<size_t>(w)][static_cast<size_t>(code)];
@@ -205,7 +208,7 @@ bool FrameDecoder::begins(int code, Track& t) {
 void FrameDecoder::holdOrEnd(int code, Track& t) {
     double level = 0.0;
     for (int w = 0; w < t.holdWindows; ++w) {
-        const Peak p = find(w, code);
+        const Peak p = find(w, code, mRanges[static_cast<size_t>(w)][static_cast<size_t>(code)].hold);
         if (p.bin < 0) continue;
         level = std::max(level, p.power);
         if (p.ratio >= mRanges[static_cast<size_t>(w)][static_cast<size_t>(code)].hold) {

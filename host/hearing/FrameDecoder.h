@@ -24,8 +24,7 @@
 //
 // Real time: addFrame neither allocates nor blocks nor makes system calls; all memory is
 // taken by the constructor. Construction and destruction take a lock around FFTW's
-// planner (plans are measured, a few tens of ms) and may run on any thread; one object is
-// fed from one thread at a time.
+// planner and may run on any thread; one object is fed from one thread at a time.
 #pragma once
 #include <array>
 #include <cstdint>
@@ -128,7 +127,7 @@ private:
         int bin = -1;
         double hz = 0.0;
         double power = 0.0;  // interpolated, as a sine's A^2
-        double ratio = 0.0;  // bin power over the noise around it
+        double ratio = 0.0;  // bin power over the noise around it (0: below what was asked)
     };
     struct Track {
         bool sounding = false;
@@ -139,7 +138,8 @@ private:
     };
 
     bool fresh(int length) const { return length < kEveryOtherFrom || mFrames % 2 == 0; }
-    Peak find(int window, int code) const;
+    // The highest peak in the code's range; its ratio is left 0 when it cannot reach `least`.
+    Peak find(int window, int code, double least) const;
     bool harmonicOfStronger(const SpectrumWindow& w, const Peak& p) const;
     bool pureLine(int window, const SpectrumWindow& w, const Peak& p) const;
     static double returnLevel(const Track& t);

@@ -91,6 +91,19 @@ double SpectrumWindow::quietestNoise() const {
     return 6.0 * kQuietestVariance / mLength;
 }
 
+double SpectrumWindow::noiseBound(int bin, int gap) const {
+    const int keep = mCount - rankOf(mCount) + 1;
+    auto least = [&](int from, int step) {
+        float m = power(from);
+        for (int i = 1; i < keep; ++i) m = std::min(m, power(from + step * i));
+        return static_cast<double>(m);
+    };
+    double n = 0.0;
+    if (referenceBelow(bin, gap)) n = least(bin - gap, -kReferenceStep);
+    if (referenceAbove(bin, gap)) n = std::max(n, least(bin + gap, kReferenceStep));
+    return std::max(n, 1e-20);
+}
+
 int SpectrumWindow::peak(int lo, int hi) const {
     lo = std::max(lo, 1);
     hi = std::min(hi, bins() - 2);

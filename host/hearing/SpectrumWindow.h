@@ -17,7 +17,7 @@ public:
     // kReferenceGap bins away (outside the main lobe of a line at the bin); the estimate is
     // the rank-th smallest, rank = 3/4 of count, so a quarter may hold other lines.
     static constexpr int kMaxReferenceCount = 128;
-    static constexpr int kInsertionKeep = 17;  // up to 64 references
+    static constexpr int kInsertionKeep = 9;  // up to 32 references
     static constexpr int kReferenceStep = 2;
     static constexpr int kReferenceGap = 3;
     static constexpr int rankOf(int count) { return count * 3 / 4; }
@@ -50,6 +50,9 @@ public:
     // sloped spectrum never reads quieter than the side it rises towards; never under
     // quietestNoise().
     double noise(int bin, int gap) const;
+    // A cheap lower bound of noise(bin, gap): on each side the least of the nearest
+    // count - rank + 1 references (among that many, one lies at or below the rank-th).
+    double noiseBound(int bin, int gap) const;
 
     // The largest power in [lo, hi] at a local maximum (not below either neighbour):
     // its bin, or -1.
