@@ -45,6 +45,9 @@ bool hearRecording(korvo::platform::Recording& recording, Decoder& decoder, doub
             samples += got;
             ended = got < korvo::kFrameSamples;
             std::fill(frame.begin() + got, frame.end(), int16_t{0});
+        } else {
+            // After the file a live microphone captures silence.
+            std::fill(frame.begin(), frame.end(), int16_t{0});
         }
         if (ended) ++tail;
         const int16_t* one = frame.data();

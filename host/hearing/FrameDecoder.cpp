@@ -70,6 +70,7 @@ double FrameDecoder::threshold(int window, int code) const {
 void FrameDecoder::reset() {
     std::fill(mHistory.begin(), mHistory.end(), 0.0f);
     mFrames = 0;
+    mFramePower.fill(0.0);
     for (Track& t : mTracks) t = Track{};
     for (auto& a : mLastHz) a.fill(-1.0);
     mSounding = 0;
@@ -185,7 +186,7 @@ bool FrameDecoder::begins(int code, Track& t) {
         // Only samples heard so far, and none from before the code's last end.
         if (win.length() > mFrames * korvo::kFrameSamples) break;
         if (t.sinceEnd >= 0 && win.length() > t.sinceEnd * korvo::kFrameSamples) break;
-        if (!fresh(win.length())) continue;
+        if (!fresh(win.length()) || (w > 0 && !live(win.length()))) continue;
         const Peak p = find(w, code, mRanges[static_cast<size_t>(w)][static_cast<size_t>(code)].start);
         // Beyond one frame a window shares most samples with its previous frame's: a steady
         // line reads the same frequency there, a voice's gliding harmonic does not.
@@ -224,10 +225,24 @@ void FrameDecoder::holdOrEnd(int code, Track& t) {
     }
 }
 
+bool FrameDecoder::live(int length) const {
+    const int frames = length / korvo::kFrameSamples;
+    const auto slots = static_cast<int64_t>(mFramePower.size());
+    double sum = 0.0;
+    for (int64_t f = mFrames - frames; f < mFrames; ++f) sum += mFramePower[static_cast<size_t>(f % slots)];
+    return mFramePower[static_cast<size_t>((mFrames - 1) % slots)] >= kLiveShare * sum / frames;
+}
+
 CodeSet FrameDecoder::addFrame(const int16_t* samples) {
     constexpr int n = korvo::kFrameSamples;
     std::memmove(mHistory.data(), mHistory.data() + n, sizeof(float) * (kHistory - n));
-    for (int i = 0; i < n; ++i) mHistory[static_cast<size_t>(kHistory - n + i)] = static_cast<float>(samples[i] * korvo::kInputScale);
+    double power = 0.0;
+    for (int i = 0; i < n; ++i) {
+        const float v = static_cast<float>(samples[i] * korvo::kInputScale);
+        mHistory[static_cast<size_t>(kHistory - n + i)] = v;
+        power += static_cast<double>(v) * v;
+    }
+    mFramePower[static_cast<size_t>(mFrames % static_cast<int64_t>(mFramePower.size()))] = power / n;
     ++mFrames;
     for (auto& w : mWindows) {
         if (w->length() > mFrames * n) break;

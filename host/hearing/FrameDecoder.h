@@ -138,6 +138,11 @@ private:
     };
 
     bool fresh(int length) const { return length < kEveryOtherFrom || mFrames % 2 == 0; }
+    // Whether the newest frame still holds sound a window of `length` samples holds: a window
+    // whose sound has ended (a recording's noise cut to digital silence, a voice's pause)
+    // shows the same old samples frame after frame, and their noise peaks read as steady
+    // lines. Its newest frame must carry at least kLiveShare of the window's mean power.
+    bool live(int length) const;
     // The highest peak in the code's range; its ratio is left 0 when it cannot reach `least`.
     Peak find(int window, int code, double least) const;
     bool harmonicOfStronger(const SpectrumWindow& w, const Peak& p) const;
@@ -151,6 +156,8 @@ private:
     std::array<double, kWindows> mSiblingFactor{};  // a sibling counts as a line at this factor over its noise
     double mLineFactor = 0.0;  // a fundamental counts as a line at this factor over its noise
     std::vector<float> mHistory;
+    static constexpr double kLiveShare = 0.1;  // -10 dB: a steady tone or noise keeps about 1
+    std::array<double, kHistory / korvo::kFrameSamples> mFramePower{};  // by frame number, modulo
     int64_t mFrames = 0;
     std::array<Track, kCodes> mTracks{};
     CodeSet mSounding = 0;
