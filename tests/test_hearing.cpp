@@ -93,28 +93,22 @@ TEST(Calibration, ProposesTheLevelsTheNoiseModelGives) {
     steady.addStep(room.data());
     steady.addStep(room.data());
     EXPECT_EQ(steady.frames(), 1);
-    Calibration::Proposal p = steady.propose(DecoderKind::Builtin);
+    Calibration::Proposal p = steady.propose();
     EXPECT_EQ(p.level, 49);
     EXPECT_LT(p.falsePer10k, 1.0);
     EXPECT_GT(steady.builtinFalsePerStep(48), 1e-4);
-    // The host's level: five levels under the quietest twentieth of the room's bins.
-    Levels uneven = flat(50.0f);
-    for (int b = 20; b < 40; ++b) uneven[b] = 30.0f;  // 20 of bins 20..255
-    Calibration host;
-    host.addStep(uneven.data());
-    EXPECT_EQ(host.propose(DecoderKind::Host).level, 25);
 
     // A steady tone on a code's entry (masked entry 30 + 10c shows bin 29 + 10c) is no level's noise.
     Levels tone = flat(40.0f);
     tone[korvo::codeIndex(6) - 1] = 80.0f;
     Calibration toned;
     toned.addStep(tone.data());
-    EXPECT_GE(toned.propose(DecoderKind::Builtin).level, 80);
+    EXPECT_GE(toned.propose().level, 80);
 
     Calibration silent;
     const Levels nothing{};
     for (int n = 0; n < 5; ++n) silent.addStep(nothing.data());
-    p = silent.propose(DecoderKind::Builtin);
+    p = silent.propose();
     EXPECT_TRUE(p.silent);
     EXPECT_EQ(p.level, 0);
 }

@@ -70,7 +70,7 @@ int runCalibrate(const CommonOptions& common, const CalibrateOptions& o) {
     session.close();
     if (outcome != Outcome::Done) return exitStatusOf(outcome);
 
-    const Calibration::Proposal chosen = calibration.propose(kind);
+    const Calibration::Proposal chosen = calibration.propose();
     if (chosen.silent) {
         infof("the room is silent: the read-out shows no bin above its floor\n");
     } else {

@@ -98,7 +98,7 @@ Outcome LiveHearing::applyLevel(const LevelChoice& level) {
     Calibration calibration;
     const Outcome o = listenToRoom(kAutoCalibrationSteps, &calibration);
     if (o != Outcome::Done) return o;
-    const Calibration::Proposal p = calibration.propose(mKind);
+    const Calibration::Proposal p = calibration.propose();
     setLevel(p.level);
     infof("detection level %d (calibrated on %.1f s of the room for the %s decision)\n", p.level,
           stepSeconds(kAutoCalibrationSteps), decoderName(mKind));

@@ -42,7 +42,7 @@ double Calibration::builtinFalsePerStep(int level) const {
     return sum / mSteps;
 }
 
-Calibration::Proposal Calibration::propose(DecoderKind kind) const {
+Calibration::Proposal Calibration::propose() const {
     Proposal p;
     std::vector<float> room;
     float loudestCode = -HUGE_VALF;
@@ -60,12 +60,6 @@ Calibration::Proposal Calibration::propose(DecoderKind kind) const {
     }
     std::sort(room.begin(), room.end());
     p.noiseLevel = room[room.size() / 2];
-    if (kind == DecoderKind::Host) {
-        const int floorLevel = static_cast<int>(std::floor(room[room.size() / 20])) - kFloorMarginLevels;
-        p.level = std::clamp(floorLevel, kOpenLevel, kMaxLevel);
-        p.falsePer10k = 0.0;
-        return p;
-    }
     int level = std::max(kOpenLevel, static_cast<int>(std::ceil(loudestCode)));
     while (level < kMaxLevel && builtinFalsePerStep(level) >= kTargetPerStep) ++level;
     p.level = level;

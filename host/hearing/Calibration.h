@@ -1,6 +1,7 @@
-// Proposes a detection level from what a listener hears of the room alone.
+// Proposes a detection level for HearFreqIdx's decision (--decoder builtin) from what a
+// listener hears of the room alone; the host's decoder takes no level.
 //
-// For HearFreqIdx's decision (--decoder builtin) the level is its only defence: a
+// For HearFreqIdx's decision the level is its only defence: a
 // masked entry above it may be named as a code. In noise, a bin's power in one frame
 // is exponentially distributed about the mean power around it, so the chance that code
 // c's entry passes level L in frame t is exp(-P(L) / mu(t, c)), mu(t, c) being the mean
@@ -9,11 +10,6 @@
 // chances, summed over the codes and spread over the hearing steps, stay under one false
 // code in 10,000 steps, and that no code entry of the room reached during calibration
 // (a steady tone in the room would be heard every time).
-//
-// The host's own decision compares each code's bin with the noise around it and keeps
-// noise alone far under that rate at any level; the level only has to leave that noise
-// in the read-out. Its proposal lies kFloorMarginLevels under the quietest twentieth of
-// the room's bins.
 #pragma once
 #include <array>
 #include <vector>
@@ -29,7 +25,6 @@ public:
     // The level at which a read-out shows every bin: calibration reads at it.
     static constexpr int kOpenLevel = kMinLevel;
     static constexpr double kTargetPerStep = 1e-4;
-    static constexpr int kFloorMarginLevels = 5;
     static constexpr int kLocalBins = 6;  // on each side of a code entry's bin
 
     // One hearing step's read-out (getSpectrumData at kOpenLevel).
@@ -43,7 +38,7 @@ public:
         double noiseLevel = 0.0;   // median bin level of the room (-inf when silent)
         bool silent = false;       // nothing above the read-out's floor: the default level stays
     };
-    Proposal propose(DecoderKind kind) const;
+    Proposal propose() const;
     // Expected false codes of HearFreqIdx's decision per step at `level`.
     double builtinFalsePerStep(int level) const;
 

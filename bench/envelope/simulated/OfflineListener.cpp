@@ -26,7 +26,7 @@ CodeSet OfflineListener::step(const int16_t* frame) {
         mEar.spectrum(levels);
         mCalibration.addStep(levels);
         if (n == kWarmUpSteps + kAutoCalibrationSteps) {
-            mProposal = mCalibration.propose(mKind);
+            mProposal = mCalibration.propose();
             mDecisionEar->setDetectionLevel(mProposal.level);
             mCalibrating = false;
             mCalibrated = true;
