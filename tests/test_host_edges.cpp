@@ -175,4 +175,21 @@ TEST_F(HostEdges, ResultsNumbersNamesAndSettingsAsAPersonMeansThem) {
     EXPECT_EQ(r.err, line("KORVO_LOG_LEVEL: 'Z' is not a log level (V, D, I, W, E or F)"));
 }
 
+// Code 30 above half a 44.1 kHz speaker's rate folds back 1.55 % above code 15: `say` tells
+// which code a listener will report, and the recording of what it played is heard so.
+TEST_F(HostEdges, AFoldedCodeIsHeardAsTheCodeSayTells) {
+    const ProcessResult said = shell("\"$H\" say 30 --ms 300 --speaker wav:folded.wav");
+    ASSERT_EQ(said.status, 0) << said.err;
+    EXPECT_NE(said.out.find("plays 15720 Hz instead, which the host's decoder hears as code 15 (15480 Hz"),
+              std::string::npos) << said.out;
+    sox("-n -r 44100 -b 16 noise.wav synth 1 whitenoise vol 0.001");  // a room's faint noise under it
+    sox("-m folded.wav noise.wav noisy.wav");
+    const ProcessResult heard = shell("\"$H\" scan noisy.wav -q");
+    ASSERT_EQ(heard.status, 0) << heard.err;
+    const size_t first = heard.out.find("heard code ");
+    ASSERT_NE(first, std::string::npos) << heard.out;
+    EXPECT_EQ(heard.out.compare(first, 25, "heard code 15 (15480 Hz)\n"), 0) << heard.out;
+    EXPECT_EQ(heard.out.find("heard code ", first + 1), std::string::npos) << heard.out;  // once, and nothing else
+}
+
 }  // namespace

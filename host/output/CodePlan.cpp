@@ -1,10 +1,21 @@
 #include "host/output/CodePlan.h"
 
+#include <algorithm>
+#include <cmath>
+
+#include "host/hearing/FrameDecoder.h"
 #include "host/output/JsonEvent.h"
 #include "host/output/Output.h"
 
 namespace korvo {
 namespace host {
+
+int codeNear(int hz) {
+    for (int c = 0; c < kHostCodes; ++c) {
+        if (std::fabs(static_cast<double>(hz) / codeHz(c) - 1.0) <= FrameDecoder::kTolerance) return c;
+    }
+    return -1;
+}
 
 std::string codeTruth(int code, int outputRate) {
     const int hz = codeHz(code);
@@ -18,11 +29,20 @@ std::string codeTruth(int code, int outputRate) {
         return text;
     }
     if (2 * hz > outputRate) {
-        const int folded = outputRate - hz;
-        snprintf(text, sizeof text,
-                 "code %d (%d Hz) lies above half the output rate (%d Hz): the speaker plays %d Hz instead, "
-                 "which no code stands for, and no listener reports a code",
-                 code, hz, outputRate / 2, folded > 0 ? folded : 0);
+        const int folded = std::max(outputRate - hz, 0);
+        const int near = codeNear(folded);
+        if (near >= 0) {
+            snprintf(text, sizeof text,
+                     "code %d (%d Hz) lies above half the output rate (%d Hz): the speaker plays %d Hz instead, "
+                     "which the host's decoder hears as code %d (%d Hz; it allows a sender %.1f %% off); "
+                     "HearFreqIdx's decision reports nothing",
+                     code, hz, outputRate / 2, folded, near, codeHz(near), 100.0 * FrameDecoder::kTolerance);
+        } else {
+            snprintf(text, sizeof text,
+                     "code %d (%d Hz) lies above half the output rate (%d Hz): the speaker plays %d Hz instead, "
+                     "which no code stands for, and no listener reports a code",
+                     code, hz, outputRate / 2, folded);
+        }
     } else {
         snprintf(text, sizeof text,
                  "code %d (%d Hz) lies above half the capture rate (%d Hz): a listener cannot capture it, and "
@@ -43,7 +63,8 @@ const char* const kReachText =
     "the spectrum's 256 bins and are heard by the host's decision; HearFreqIdx's decision\n"
     "(--decoder builtin) reads a masked spectrum whose bands end with code 17 (17200 Hz).\n"
     "Codes 23..39 (22360 Hz and up) lie above half the capture rate (22050 Hz): no\n"
-    "listener reports them.";
+    "listener reports them as themselves. (A 44.1 kHz speaker plays 23..36 folded back near\n"
+    "code 45-c, which the host's decoder, allowing a sender 2.5 % off, hears as that code.)";
 
 void printHeard(int code, double t) {
     resultf(JsonEvent("heard").add("code", code).add("hz", codeHz(code)).add("t_s", t), "%8.3f s  heard code %d (%d Hz)\n",

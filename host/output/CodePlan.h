@@ -15,6 +15,9 @@ using korvo::codeOfIndex;
 
 constexpr int kCodeCount = korvo::kPlanCodes;
 
+// The code the host's decoder takes a tone of `hz` for (within the share of its frequency
+// it allows a sender's clock), or -1.
+int codeNear(int hz);
 // What listeners report when code `code` is said, in a sentence ("" when every listener
 // hears it as itself), for a speaker whose output runs at `outputRate` Hz.
 std::string codeTruth(int code, int outputRate);
