@@ -254,45 +254,61 @@ void print(const char* name, const Tally& t) {
 
 void distortions(FrameDecoder& d, const std::string& dir) {
     std::printf("\n== distortion, clipping, clock error (every code, 300 ms tone, 30 dB SNR)\n");
-    Tally poly, drive, clip, clip3, low, high;
+    const double kThd[] = {1.0, 3.0, 10.0};   // per cent
+    const int kClipDb[] = {3, 6, 12};          // over full scale
+    const double kOffset[] = {0.1, 0.5, 1.0, 2.0};  // per cent, each side
+    Tally poly[3], clip[3], drive, off[4][2];
     for (int c = 0; c < kCodes; ++c) {
         std::mt19937_64 rng(99u + static_cast<uint64_t>(c));
         const double hz = korvo::codeHz(c);
         const int64_t start = ms(200) + static_cast<int64_t>(rng() % kFrame);
-        // A loudspeaker of 10 % THD: 2nd and 3rd harmonics of 7.1 % each (Chebyshev terms).
-        {
-            const double a = 0.3;
+        // A loudspeaker of THD k %: 2nd and 3rd harmonics of k / sqrt(2) % each (Chebyshev terms).
+        for (int i = 0; i < 3; ++i) {
+            const double a = 0.3, h = kThd[i] / 100.0 / std::sqrt(2.0);
             std::vector<double> x = whiteNoise(static_cast<size_t>(start + ms(600)), a, 30, rng);
-            for (int64_t i = 0; i < ms(300); ++i) {
-                const double u = std::sin(2.0 * kPi * hz * static_cast<double>(i) / kRate);
-                x[static_cast<size_t>(start + i)] += a * (u + 0.0707 * (2 * u * u - 1) + 0.0707 * (4 * u * u * u - 3 * u));
+            for (int64_t n = 0; n < ms(300); ++n) {
+                const double u = std::sin(2.0 * kPi * hz * static_cast<double>(n) / kRate);
+                x[static_cast<size_t>(start + n)] += a * (u + h * (2 * u * u - 1) + h * (4 * u * u * u - 3 * u));
             }
-            tally(poly, decode(d, x), c);
+            tally(poly[i], decode(d, x), c);
         }
         std::vector<double> clean = whiteNoise(static_cast<size_t>(start + ms(600)), 0.5, 30, rng);
         addTone(clean, hz, start, ms(300), 0.5, 0.3);
         Samples s(clean.size());
         for (size_t i = 0; i < clean.size(); ++i) s[i] = static_cast<int16_t>(std::clamp(std::lround(clean[i] * 32768.0), -32768L, 32767L));
         tally(drive, decode(d, toDouble(soxEffect(s, "overdrive 10", dir))), c);
-        tally(clip, decode(d, toDouble(soxEffect(s, "gain 12", dir))), c);   // 0.5 (-6 dBFS) up 12 dB: +6 dB over full scale
-        tally(clip3, decode(d, toDouble(soxEffect(s, "gain 9", dir))), c);   // +3 dB
-        for (int side : {-1, 1}) {
-            std::vector<double> x = whiteNoise(static_cast<size_t>(start + ms(600)), kToneAmplitude, 10, rng);
-            addTone(x, hz * (1.0 + 0.02 * side), start, ms(300), kToneAmplitude, 0.1);
-            tally(side < 0 ? low : high, decode(d, x), c);
+        // 0.5 (-6 dBFS) raised by 6 + k dB: k dB over full scale.
+        for (int i = 0; i < 3; ++i) tally(clip[i], decode(d, toDouble(soxEffect(s, "gain " + std::to_string(6 + kClipDb[i]), dir))), c);
+        for (int i = 0; i < 4; ++i) {
+            for (int side : {0, 1}) {
+                std::vector<double> x = whiteNoise(static_cast<size_t>(start + ms(600)), kToneAmplitude, 10, rng);
+                addTone(x, hz * (1.0 + kOffset[i] / 100.0 * (side ? 1 : -1)), start, ms(300), kToneAmplitude, 0.1);
+                tally(off[i][side], decode(d, x), c);
+            }
         }
     }
-    print("distortion 10 % THD", poly);
+    char name[64];
+    for (int i = 0; i < 3; ++i) {
+        std::snprintf(name, sizeof name, "distortion %g %% THD", kThd[i]);
+        print(name, poly[i]);
+    }
     print("sox overdrive 10", drive);
-    print("clipping +6 dB", clip);
-    print("clipping +3 dB", clip3);
-    print("2 % low, 10 dB SNR", low);
-    print("2 % high, 10 dB SNR", high);
+    for (int i = 0; i < 3; ++i) {
+        std::snprintf(name, sizeof name, "clipping +%d dB", kClipDb[i]);
+        print(name, clip[i]);
+    }
+    for (int i = 0; i < 4; ++i) {
+        for (int side : {0, 1}) {
+            std::snprintf(name, sizeof name, "%g %% %s, 10 dB SNR", kOffset[i], side ? "high" : "low");
+            print(name, off[i][side]);
+        }
+    }
 }
 
-// Every code in turn (150 ms tones, 150 ms apart) through sox's reverb 90.
+// Every code in turn (150 ms tones, 150 ms apart) through sox's reverb 50 and 90.
 void reverb(FrameDecoder& d, const std::string& dir) {
-    std::printf("\n== reverberation (sox reverb 90), every code in turn, 150 ms tones with 150 ms gaps\n");
+  for (int amount : {50, 90}) {
+    std::printf("\n== reverberation (sox reverb %d), every code in turn, 150 ms tones with 150 ms gaps\n", amount);
     for (int order = 0; order < 2; ++order) {
         std::mt19937_64 rng(777u + static_cast<uint64_t>(order));
         std::vector<int> codes(kCodes);
@@ -303,7 +319,7 @@ void reverb(FrameDecoder& d, const std::string& dir) {
         for (int i = 0; i < kCodes; ++i) addTone(x, korvo::codeHz(codes[static_cast<size_t>(i)]), ms(300) + step * i, ms(150), 0.1, 0.0);
         Samples s(x.size());
         for (size_t i = 0; i < x.size(); ++i) s[i] = static_cast<int16_t>(std::lround(x[i] * 32768.0));
-        const auto events = decode(d, toDouble(soxEffect(s, "reverb 90", dir)));
+        const auto events = decode(d, toDouble(soxEffect(s, "reverb " + std::to_string(amount), dir)));
         std::vector<int> count(kCodes, 0);
         int wrong = 0;
         for (size_t i = 0; i < events.size(); ++i) {
@@ -316,6 +332,7 @@ void reverb(FrameDecoder& d, const std::string& dir) {
         for (int c : count) missed += c == 0, twice += c > 1;
         std::printf("%-10s events %zu, missed %d, reported twice %d, wrong %d\n", order ? "shuffled" : "ascending", events.size(), missed, twice, wrong);
     }
+  }
 }
 
 // The same code twice with a 150 ms gap, 100 ms tones at 10 dB SNR.
