@@ -77,7 +77,7 @@ int64_t ms(double m) { return static_cast<int64_t>(m * kRate / 1000.0); }
 // Tones of `lengthMs` at each SNR, every code, `trials` each: the share heard as their code.
 void detection(FrameDecoder& d, int trials) {
     const std::vector<std::pair<int, std::vector<double>>> plan = {
-        {40, {-6, -8, -10}}, {64, {-9, -11, -13}}, {192, {-13, -15, -17}}, {300, {-16, -18, -20}}};
+        {40, {-6, -8, -10}}, {64, {-9, -11, -13}}, {100, {-11, -13, -15}}, {192, {-13, -15, -17}}, {300, {-16, -18, -20}}};
     std::printf("\n== detection in white noise (%d trials per code and point)\n", trials);
     std::printf("%8s %8s %10s %8s %s\n", "tone ms", "SNR dB", "heard %", "wrong", "worst code");
     for (const auto& [lengthMs, snrs] : plan) {
