@@ -40,7 +40,7 @@ const std::vector<double> kSnrs = {30, 20, 10, 5, 0, -3, -6, -8, -9, -10, -11, -
 // Speech-like noise is pink and pauses between syllables: it holds far less power at the
 // codes' frequencies than its full-band figure says, so its grid reaches further down.
 const std::vector<double> kSpeechSnrs = {30, 20, 10, 0, -10, -15, -20, -25, -30, -35, -40, -45};
-const std::vector<double> kToneLengths = {20, 30, 40, 50, 60, 70, 80, 90, 100, 120, 150, 200, 300};
+const std::vector<double> kToneLengths = {20, 30, 40, 50, 64, 80, 100, 120, 150, 192, 300};
 const std::vector<double> kNoiseLevels = {-80, -70, -60, -50, -40, -30, -20, -10};
 const DecoderKind kDecoders[] = {DecoderKind::Host, DecoderKind::Builtin};
 constexpr double kLengthSnr = 10.0;   // tone lengths are measured at this SNR
