@@ -5,7 +5,7 @@
 #
 #   scripts/listen-cost.sh [SECONDS] [listen arguments...]
 #
-# Default: 1800 s in a simulated room with white noise at -40 dBFS (the host's decision at
+# Default: 1800 s in a simulated room with white noise at -40 dBFS (the host's decoder at
 # a calibrated level). Needs a build (cmake --build --preset default).
 set -euo pipefail
 cd "$(dirname "$0")/.."

@@ -1,4 +1,4 @@
-// The hearing of read-outs: the builtin decision's guard, code events, the calibration's
+// The hearing of read-outs: the builtin decoder's guard, code events, the calibration's
 // proposals, the simulated capture and analysis, and the levelled ear.
 #include <algorithm>
 #include <array>
@@ -9,7 +9,7 @@
 
 #include <gtest/gtest.h>
 
-#include "host/hearing/BuiltinDecision.h"
+#include "host/hearing/BuiltinDecoder.h"
 #include "host/hearing/Calibration.h"
 #include "host/hearing/CodeEvents.h"
 #include "host/hearing/LevelledEar.h"
@@ -52,9 +52,9 @@ public:
     void setDetectionLevel(int l) override { level = l; }
 };
 
-TEST(BuiltinDecision, ThePeaksAreCodesUnlessAToneAboveTheBandsLeaksIntoThem) {
+TEST(BuiltinDecoder, ThePeaksAreCodesUnlessAToneAboveTheBandsLeaksIntoThem) {
     FakeEar ear;
-    BuiltinDecision d;
+    BuiltinDecoder d;
     ear.first = korvo::codeIndex(17);
     ear.second = korvo::codeIndex(4);
     ear.masked[ear.first] = 60.0f;

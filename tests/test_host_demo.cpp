@@ -66,7 +66,7 @@ TEST(HostDemo, InNoiseWithAndWithoutAcknowledgementAndDrownedByIt) {
     r = runHost(kHost, {"demo", "--rounds", "3", "--snr", "5"}, kRunMs);
     EXPECT_EQ(r.status, 0) << r.out << r.err;
     EXPECT_NE(r.out.find("3 of 3 exchanges completed, round trip median"), std::string::npos) << r.out;
-    // The plug-in's own one-frame decision, which the host's decision outhears.
+    // The plug-in's own one-frame decision, which the host's decoder outhears.
     r = runHost(kHost, {"demo", "--decoder", "builtin", "--snr", "-9", "--rounds", "2", "--timeout-ms", "1000"}, kRunMs);
     EXPECT_EQ(r.status, 1);
     EXPECT_NE(r.out.find("0 of 2 exchanges completed"), std::string::npos) << r.out;

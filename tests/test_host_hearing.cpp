@@ -1,5 +1,5 @@
 // How the soundmeter command hears: scan against a live listen on the same recordings,
-// the host's decoder on sox-made recordings, the builtin decision's calibrated level in a
+// the host's decoder on sox-made recordings, the builtin decoder's calibrated level in a
 // noisy room, and what the spectrogram and the monitor show of a recording.
 #include <cairo.h>
 

@@ -1,5 +1,5 @@
 // soundmeter calibrate: listens to the room alone and proposes a detection level for
-// the builtin decision (host/hearing/Calibration.h says how), or tells whether the room
+// the builtin decoder (host/hearing/Calibration.h says how), or tells whether the room
 // alone sounds like a code to the host's decoder.
 #include <cmath>
 

@@ -1,7 +1,7 @@
 // soundmeter monitor: a live view of the read-out in the terminal.
 //
 // It shows the spectrum the decoder heard: the host's decoder its own spectrum of every
-// frame, the builtin decision the meter's read-out at the open level (the decoder hears
+// frame, the builtin decoder the meter's read-out at the open level (the decoder hears
 // with the detection level applied by the host), so each band's noise floor shows.
 #include <string>
 

@@ -1,7 +1,7 @@
 // soundmeter spectrogram: a picture of the spectrum a listener's decoder heard, from a
 // microphone route in real time or from a file as fast as the processor allows, with
 // the codes it heard, the same as listen or scan. The host's decoder shows its own
-// spectrum of every frame; the builtin decision the plug-in's read-out at the open level
+// spectrum of every frame; the builtin decoder the plug-in's read-out at the open level
 // (it hears with the level applied by the host: LevelledEar).
 #include <CLI/CLI.hpp>
 

@@ -10,7 +10,7 @@ LiveHearing::LiveHearing(Device& device, DecoderKind kind, bool seeAll)
     : mDevice(device),
       mKind(kind),
       mEar(device.meter()),
-      mDecisionEar(mEar, seeAll && decoderInfo(kind).takesLevel),
+      mDecoderEar(mEar, seeAll && decoderInfo(kind).takesLevel),
       mDecoder(makeDecoder(kind)) {}
 
 CodeSet LiveHearing::step() {
@@ -22,7 +22,7 @@ CodeSet LiveHearing::step() {
         StepInput in;
         in.frames = frames;
         in.frameCount = count;
-        in.ear = &*mDecisionEar;
+        in.ear = &*mDecoderEar;
         return mDecoder->hear(in);
     }
     // Frame by frame, so that a code's time is the frame where it began, as offline.
@@ -78,11 +78,11 @@ Outcome LiveHearing::listenToRoom(int steps, Calibration* calibration) {
 
 void LiveHearing::setLevel(int level) {
     if (!decoderInfo(mKind).takesLevel) return;
-    mDecisionEar->setDetectionLevel(level);
+    mDecoderEar->setDetectionLevel(level);
     mDecoder->reset();  // what it saw at another level says nothing at this one
 }
 
-int LiveHearing::level() { return decoderInfo(mKind).takesLevel ? mDecisionEar->detectionLevel() : -1; }
+int LiveHearing::level() { return decoderInfo(mKind).takesLevel ? mDecoderEar->detectionLevel() : -1; }
 
 int LiveHearing::seenSpectrum(float* out) {
     if (mDecoder->spectrum(out)) return korvo::kSpectrumBins;

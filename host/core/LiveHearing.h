@@ -50,7 +50,7 @@ private:
     Device& mDevice;
     DecoderKind mKind;
     MeterEar mEar;
-    DecisionEar mDecisionEar;
+    DecoderEar mDecoderEar;
     std::unique_ptr<Decoder> mDecoder;
     int64_t mFrames = 0;      // frames the decoder heard
     int64_t mEventFrame = 0;  // where the last step's codes began (0: none began)

@@ -11,7 +11,7 @@ namespace host {
 namespace {
 
 constexpr int kLastBin = korvo::kLastSpectrumEntry;
-// The bins the decisions look at: from a little below code 0 to the read-out's end.
+// The bins the decoders look at: from a little below code 0 to the read-out's end.
 constexpr int kFirstRoomBin = 20;
 
 }  // namespace

@@ -1,6 +1,6 @@
 #include "host/hearing/Decoder.h"
 
-#include "host/hearing/BuiltinDecision.h"
+#include "host/hearing/BuiltinDecoder.h"
 #include "host/hearing/CodeEvents.h"
 #include "host/hearing/FrameDecoder.h"
 
@@ -32,7 +32,7 @@ private:
 class Builtin : public Decoder {
 public:
     CodeSet hear(const StepInput& in) override {
-        mHeard = in.ear ? mDecision.decide(*in.ear) : 0;
+        mHeard = in.ear ? mBuiltin.decide(*in.ear) : 0;
         return mEvents.update(++mSteps, mHeard);
     }
     CodeSet sounding() const override { return mHeard; }
@@ -42,7 +42,7 @@ public:
     }
 
 private:
-    BuiltinDecision mDecision;
+    BuiltinDecoder mBuiltin;
     CodeEvents mEvents;
     int64_t mSteps = 0;
     CodeSet mHeard = 0;

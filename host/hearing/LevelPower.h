@@ -1,5 +1,5 @@
 // Read-out levels: their range, and a level as power: one level unit is 1.2 dB, so power goes as 10^(0.12 L)
-// (up to a constant factor, which every ratio the decisions take cancels).
+// (up to a constant factor, which every ratio the decoders take cancels).
 #pragma once
 #include <cmath>
 

@@ -45,9 +45,9 @@ private:
 };
 
 // The ear a decoder hears through: the ear itself, or, to see every bin, a LevelledEar over it.
-class DecisionEar {
+class DecoderEar {
 public:
-    DecisionEar(Ear& ear, bool seeAll)
+    DecoderEar(Ear& ear, bool seeAll)
         : mLevelled(seeAll ? std::make_unique<LevelledEar>(ear) : nullptr),
           mEar(mLevelled ? static_cast<Ear&>(*mLevelled) : ear) {}
     Ear& operator*() { return mEar; }

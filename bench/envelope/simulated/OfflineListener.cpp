@@ -6,7 +6,7 @@ namespace host {
 OfflineListener::OfflineListener(DecoderKind kind, int phase, bool seeAll)
     : mKind(kind),
       mEar(phase),
-      mDecisionEar(mEar, seeAll),
+      mDecoderEar(mEar, seeAll),
       mDecoder(makeDecoder(kind)) {}
 
 CodeSet OfflineListener::step(const int16_t* frame) {
@@ -27,14 +27,14 @@ CodeSet OfflineListener::step(const int16_t* frame) {
         mCalibration.addStep(levels);
         if (n == kWarmUpSteps + kAutoCalibrationSteps) {
             mProposal = mCalibration.propose();
-            mDecisionEar->setDetectionLevel(mProposal.level);
+            mDecoderEar->setDetectionLevel(mProposal.level);
             mCalibrating = false;
             mCalibrated = true;
         }
         return 0;
     }
     StepInput in;
-    in.ear = &*mDecisionEar;
+    in.ear = &*mDecoderEar;
     return mDecoder->hear(in);
 }
 

@@ -21,7 +21,7 @@ public:
     OfflineListener(DecoderKind kind, int phase, bool seeAll = false);
 
     // A fixed detection level, or calibration on the room after the warm-up.
-    void setLevel(int level) { mDecisionEar->setDetectionLevel(level); }
+    void setLevel(int level) { mDecoderEar->setDetectionLevel(level); }
     void calibrateFirst() { mCalibrating = decoderInfo(mKind).takesLevel; }
 
     // One capture step with the next frame of 512 samples: the codes that begin to be
@@ -34,7 +34,7 @@ public:
     // The frame the decision looked at last: the newest for a decoder of frames.
     int64_t analysedFrame() const { return decoderInfo(mKind).offline ? mSteps - 1 : mEar.analysedFrame(); }
     double seconds() const { return stepSeconds(steps()); }
-    int level() { return mDecisionEar->detectionLevel(); }
+    int level() { return mDecoderEar->detectionLevel(); }
     // The read-out after the last step (getSpectrumData), every bin when seeing all.
     int seenSpectrum(float* out) { return mEar.spectrum(out); }
     // What the calibration proposed, once it has run.
@@ -44,7 +44,7 @@ public:
 private:
     DecoderKind mKind;
     SimulatedEar mEar;
-    DecisionEar mDecisionEar;
+    DecoderEar mDecoderEar;
     std::unique_ptr<Decoder> mDecoder;
     int64_t mSteps = 0;
     bool mCalibrating = false;

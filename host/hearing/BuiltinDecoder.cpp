@@ -1,18 +1,18 @@
-#include "host/hearing/BuiltinDecision.h"
+#include "host/hearing/BuiltinDecoder.h"
 
 #include <initializer_list>
 
 namespace korvo {
 namespace host {
 
-bool BuiltinDecision::leakFromAbove(const float* levels, float level) {
+bool BuiltinDecoder::leakFromAbove(const float* levels, float level) {
     for (int i = korvo::kLastBandEntry + 1; i <= korvo::kLastSpectrumEntry; ++i) {
         if (levels[i] >= level + kGuardLevels) return true;
     }
     return false;
 }
 
-bool BuiltinDecision::risesAboveTheBands(const float* levels) {
+bool BuiltinDecoder::risesAboveTheBands(const float* levels) {
     const int own = korvo::codeIndex(kBuiltinCodes - 1);
     for (int d = 1; d <= kEdgeBins; ++d) {
         if (levels[own + d] > levels[own]) return true;
@@ -20,7 +20,7 @@ bool BuiltinDecision::risesAboveTheBands(const float* levels) {
     return false;
 }
 
-CodeSet BuiltinDecision::decide(Ear& ear) {
+CodeSet BuiltinDecoder::decide(Ear& ear) {
     float masked[korvo::kSpectrumBins] = {};
     if (ear.maskedSpectrum(masked) == 0) return 0;  // nothing analysed yet
     int first = -1;

@@ -14,7 +14,7 @@
 namespace korvo {
 namespace host {
 
-class BuiltinDecision {
+class BuiltinDecoder {
 public:
     static constexpr float kGuardLevels = 12.0f;  // 14.4 dB; noise alone rarely stands so far out
     static constexpr int kEdgeBins = 3;
