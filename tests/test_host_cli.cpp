@@ -57,7 +57,8 @@ TEST(HostCli, HelpVersionAndBadUsage) {
         EXPECT_EQ(r.out, "");
     }
     const ProcessResult env = run({"listen"}, {{"KORVO_MIC", "nowhere"}});
-    EXPECT_TRUE(env.status == 2 && oneLine(env, "KORVO_MIC: unknown audio route 'nowhere'"));
+    EXPECT_EQ(env.status, 2);
+    EXPECT_TRUE(oneLine(env, "KORVO_MIC: unknown audio route 'nowhere'"));
     const ProcessResult plugin = run({"listen", "--plugin=/nonexistent/lib.so"});
     EXPECT_EQ(plugin.status, 2);  // a setting that cannot be used
     EXPECT_TRUE(oneLine(plugin, "cannot load the plug-in /nonexistent/lib.so"));
@@ -84,7 +85,8 @@ TEST(HostCli, UnusableRoutesAreRefusedBeforeAnything) {
         EXPECT_EQ(r.out, "");
     }
     const ProcessResult noise = run({"listen", "--mic", "sim:x"}, {{"KORVO_SIM_NOISE", "loud"}});
-    EXPECT_TRUE(noise.status == 2 && oneLine(noise, "microphone sim:x: KORVO_SIM_NOISE='loud' is not"));
+    EXPECT_EQ(noise.status, 2);
+    EXPECT_TRUE(oneLine(noise, "microphone sim:x: KORVO_SIM_NOISE='loud' is not"));
 }
 
 TEST(HostCli, ARouteThatFailsWhileRunningEndsTheCommand) {

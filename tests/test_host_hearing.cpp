@@ -179,7 +179,8 @@ TEST_F(HostHearing, AFortyMillisecondToneIsHeardOnceAsItSounds) {
     const std::vector<Heard> heard = scan(file);
     ASSERT_EQ(heard.size(), 1u) << codesOf(heard);
     EXPECT_EQ(heard[0].code, 8);
-    EXPECT_TRUE(heard[0].seconds > starts[0] && heard[0].seconds < starts[0] + 0.04) << heard[0].seconds;
+    EXPECT_GT(heard[0].seconds, starts[0]);
+    EXPECT_LT(heard[0].seconds, starts[0] + 0.04);
 }
 
 // The luminance (0..255) of a pixel of a decoded picture.

@@ -291,7 +291,8 @@ TEST_F(Tone, EngineStartsStopsAndRestarts) {
     ASSERT_TRUE(ready(restarted));
     EXPECT_TRUE(restarted.get());
     EXPECT_EQ(p.samples, low.block(882, STOP) + high.block(882, START));
-    EXPECT_TRUE(stateOf(gen) == Engine::TONE_PLAYING && test::trackStops() == 1);  // never stopped since the first engine
+    EXPECT_EQ(stateOf(gen), Engine::TONE_PLAYING);
+    EXPECT_EQ(test::trackStops(), 1);  // never stopped since the first engine
     EXPECT_NE(locked(gen, &Engine::mStartTime).tv_sec, 0);
     EXPECT_TRUE(inOrder(toneLog(), {"Delayed start", "Stop/restart Cbk", "Cbk restarting track", "Clearing mWaveGens:",
                                     "Starting Cbk", "Cbk starting track"}));

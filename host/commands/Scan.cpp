@@ -15,7 +15,7 @@
 #include "host/core/Options.h"
 #include "host/output/Output.h"
 #include "host/core/OfflineRun.h"
-#include "host/hearing/StepClock.h"
+#include "host/base/Clock.h"
 
 namespace korvo {
 namespace host {

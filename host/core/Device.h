@@ -9,7 +9,7 @@
 #include "host/core/FrameTap.h"
 #include "host/core/Plugin.h"
 #include "host/core/RouteGuard.h"
-#include "host/hearing/StepClock.h"
+#include "host/base/Clock.h"
 #include "interface/SoundMeterConstants.h"
 #include "interface/SoundMeter_vir.h"
 

@@ -20,6 +20,9 @@
 namespace korvo {
 namespace host {
 
+// Steps --level auto listens to the room for (1.5 s).
+constexpr int kAutoCalibrationSteps = 129;
+
 class Calibration {
 public:
     // The level at which a read-out shows every bin: calibration reads at it.

@@ -11,7 +11,7 @@
 #include <cstring>
 #include <memory>
 
-#include "host/hearing/StepClock.h"
+#include "host/base/Clock.h"
 #include "host/picture/PictureFile.h"
 
 namespace korvo {

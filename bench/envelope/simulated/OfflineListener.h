@@ -9,7 +9,7 @@
 #include "host/hearing/Decoder.h"
 #include "host/hearing/LevelledEar.h"
 #include "envelope/simulated/SimulatedEar.h"
-#include "host/hearing/StepClock.h"
+#include "host/base/Clock.h"
 
 namespace korvo {
 namespace host {
