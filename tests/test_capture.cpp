@@ -22,7 +22,7 @@ using namespace korvo::testing;
 Mmic_data_t readShared(int direction = 0) {
     Mmic_data_t r;
     std::memset(&r, 0x5A, sizeof r);
-    read_write_audio(nullptr, direction, &r);
+    EXPECT_EQ(read_write_audio(nullptr, direction, &r), 1);
     return r;
 }
 
@@ -138,7 +138,7 @@ TEST_F(Capture, SharedRecordAndLevels) {
     Mmic_data_t written = fresh;
     written.index = 3, written.level = -12.5f, written.count = 212, written.reserved = 77;
     for (int i = 0; i < 2560; ++i) written.data[i] = static_cast<int16_t>(i - 1280);
-    read_write_audio(nullptr, 1, &written);
+    EXPECT_EQ(read_write_audio(nullptr, 1, &written), 1);
     for (int direction : {0, 2, -1}) {
         const Mmic_data_t r = readShared(direction);
         EXPECT_EQ(std::memcmp(&r, &written, sizeof r), 0) << direction;

@@ -250,6 +250,11 @@ TEST_F(Tone, BlocksRatesAndPrepareWave) {
         gen.prepareWave();
         EXPECT_EQ(gen.mMaxSmp, maxSmp) << ms;
     }
+    // A list that fills every segment has no terminator: it ends after its last segment.
+    for (auto& seg : Engine::sToneDescriptors[303].segments) seg = Seg{10, {4000, 0, 0, 0}, 0, 0};
+    gen.mDurationMs = 250;
+    EXPECT_TRUE(gen.prepareWave());
+    EXPECT_EQ(gen.mWaveGens.size(), 1u);
     pthread_mutex_unlock(&gen.mLock);
 }
 
