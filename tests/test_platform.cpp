@@ -13,6 +13,7 @@
 #include <map>
 #include <mutex>
 #include <thread>
+#include <tuple>
 
 #include <korvo/platform/Log.h>
 #include <korvo/platform/Routes.h>
@@ -445,10 +446,13 @@ TEST_F(Platform, EveryRouteKeepsRealTimePace) {
 }
 
 TEST_F(Platform, TwoProcessesInOneRoomHearEachOther) {
-    for (const char* gain : {"", "-6"}) {
-        SCOPED_TRACE(gain);
+    // A gain in dB, or a distance: at 2 m a path has half the level of one at 1 m.
+    for (const auto& [gain, distance, level] : {std::tuple{"", "", 8000.0}, std::tuple{"-6", "", 8000 * std::pow(10.0, -6 / 20.0)},
+                                                std::tuple{"", "2", 4000.0}}) {
+        SCOPED_TRACE(std::string(gain) + distance);
         const std::string room = uniqueRoom("two"), file = tempPath(room + ".raw");
-        Child listener = device("listen", room, {{"KORVO_ROOM_MS", "1500"}, {"KORVO_ROOM_OUT", file}, {"KORVO_SIM_GAIN", gain}});
+        Child listener = device("listen", room, {{"KORVO_ROOM_MS", "1500"}, {"KORVO_ROOM_OUT", file}, {"KORVO_SIM_GAIN", gain},
+                                                 {"KORVO_SIM_DISTANCE", distance}});
         ASSERT_TRUE(listener.waitReady());
         Child speaker = device("speak", room, {{"KORVO_ROOM_VALUE", "8000"}, {"KORVO_ROOM_MS", "300"}});
         EXPECT_EQ(speaker.waitExit(), 0);
@@ -459,7 +463,7 @@ TEST_F(Platform, TwoProcessesInOneRoomHearEachOther) {
         ASSERT_EQ(heard.size(), ms(1500));
         const auto counts = histogram(heard);
         ASSERT_EQ(counts.size(), 2u) << "silence and the speaker's level";
-        EXPECT_NEAR(counts.rbegin()->first, 8000 * std::pow(10.0, std::atof(gain) / 20), 1.0);
+        EXPECT_NEAR(counts.rbegin()->first, level, 1.0);
         EXPECT_GE(counts.rbegin()->second, ms(290)) << "what was played is heard";
         EXPECT_LE(counts.rbegin()->second, ms(300)) << "and heard once";
         EXPECT_FALSE(fs::exists(roomFile(room))) << "the last device to leave removes the room";
@@ -485,6 +489,61 @@ TEST_F(Platform, RoomSpeakersAreMixedAndClippedTo16Bits) {
         EXPECT_GE(counts[clip] + counts[sign * 20000], ms(290));
         EXPECT_GE(counts[clip] + counts[sign * 15000], ms(290));
     }
+}
+
+// The room's and the device's presets, read from the environment when a route opens.
+class RoomSetting {
+public:
+    RoomSetting(const char* name, const char* value) : mName(name) { setenv(name, value, 1); }
+    ~RoomSetting() { unsetenv(mName); }
+
+private:
+    const char* mName;
+};
+
+TEST_F(Platform, RoomPresetsShapeWhatTheMicrophoneHears) {
+    for (const auto& [name, value, says] : {
+             std::tuple{"KORVO_SIM_ROOM", "cave", "KORVO_SIM_ROOM='cave' is not a room (quiet, office, kitchen, hall, street)"},
+             std::tuple{"KORVO_SIM_DEVICE", "tablet", "KORVO_SIM_DEVICE='tablet' is not a device (ideal, phone, laptop, cheap-speaker)"},
+             std::tuple{"KORVO_SIM_DISTANCE", "0", "KORVO_SIM_DISTANCE='0' is not a distance in metres between 0.1 and 100"},
+             std::tuple{"KORVO_SIM_CLOCK_PPM", "2e3", "KORVO_SIM_CLOCK_PPM='2e3' is not a clock offset in ppm between -1000 and 1000"}}) {
+        RoomSetting setting(name, value);
+        std::string error;
+        EXPECT_EQ(makeCaptureRoute("sim:" + uniqueRoom("bad"), &error), nullptr);
+        EXPECT_EQ(error, says);
+        EXPECT_EQ(makeOutputRoute("sim:" + uniqueRoom("bad"), &error), nullptr);
+        EXPECT_EQ(error, says);
+    }
+    {
+        // A street: traffic at -25 dBFS, broadband noise at -30 and passers-by at -45.
+        RoomSetting street("KORVO_SIM_ROOM", "street");
+        auto in = makeCaptureRoute("sim:" + uniqueRoom("street"), nullptr);
+        ASSERT_TRUE(in);
+        ASSERT_EQ(in->open(kRate), 0);
+        const Samples heard = record(*in, ms(2000));
+        double energy = 0.0;
+        for (int16_t v : heard) energy += double(v) * v;
+        const double want = 10.0 * std::log10(std::pow(10.0, -2.5) + std::pow(10.0, -3.0) + std::pow(10.0, -4.5));
+        EXPECT_NEAR(10.0 * std::log10(energy / double(heard.size()) / (32768.0 * 32768.0)), want, 1.5);
+    }
+    // A phone hears its own loudspeaker from 12 cm: a loud tone clips at the microphone's full
+    // scale, as a real one does.
+    RoomSetting phone("KORVO_SIM_DEVICE", "phone");
+    const std::string room = "sim:" + uniqueRoom("clip");
+    auto in = makeCaptureRoute(room, nullptr);
+    auto out = makeOutputRoute(room, nullptr);
+    ASSERT_TRUE(in && out);
+    ASSERT_EQ(in->open(kRate), 0);
+    ASSERT_EQ(out->open(kRate), 0);
+    std::thread speaker([&] {
+        Samples tone(ms(300));
+        for (size_t i = 0; i < tone.size(); ++i) tone[i] = int16_t(12000 * std::sin(2 * M_PI * 4000.0 * double(i) / kRate));
+        for (size_t at = 0; at < tone.size(); at += kBlock) out->write(&tone[at], std::min(kBlock, tone.size() - at));
+    });
+    const auto counts = histogram(record(*in, ms(700)));
+    speaker.join();
+    EXPECT_GT(counts.count(32767) ? counts.at(32767) : 0, ms(20));
+    EXPECT_GT(counts.count(-32768) ? counts.at(-32768) : 0, ms(20));
 }
 
 TEST_F(Platform, WhatDeadProcessesLeftIsReclaimedAndRoomsArePrivate) {

@@ -29,21 +29,7 @@ double Gaussian::next() {
 
 NoiseSource::NoiseSource(Noise kind, uint64_t seed) : mKind(kind), mGaussian(seed), mRandom(seed ^ 0x5bd1e995u) {}
 
-// Pink noise: white noise through a sum of first-order filters whose corners are spread
-// over the band (a classic approximation of a 1/f power spectrum, within 0.05 dB).
-double NoiseSource::pink() {
-    const double w = mGaussian.next();
-    double* b = mPink;
-    b[0] = 0.99886 * b[0] + w * 0.0555179;
-    b[1] = 0.99332 * b[1] + w * 0.0750759;
-    b[2] = 0.96900 * b[2] + w * 0.1538520;
-    b[3] = 0.86650 * b[3] + w * 0.3104856;
-    b[4] = 0.55000 * b[4] + w * 0.5329522;
-    b[5] = -0.7616 * b[5] - w * 0.0168980;
-    const double out = b[0] + b[1] + b[2] + b[3] + b[4] + b[5] + b[6] + w * 0.5362;
-    b[6] = w * 0.115926;
-    return out;
-}
+double NoiseSource::pink() { return mPink.next(mGaussian.next()); }
 
 // Syllables of 120..250 ms with a raised-cosine shape and a peak of 0.5..1, pauses of
 // 20..150 ms between them and a breath of 300..600 ms every 8..12 syllables; a floor

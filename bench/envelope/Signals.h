@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "interface/SoundMeterConstants.h"
+#include "routes/sim/acoustics/PinkFilter.h"
 
 namespace korvo {
 namespace envelope {
@@ -50,7 +51,7 @@ private:
     Noise mKind;
     Gaussian mGaussian;
     std::mt19937_64 mRandom;
-    double mPink[7] = {};
+    platform::acoustics::PinkFilter mPink;
     // The syllable in progress: its samples, where we are, its peak; then a pause.
     int64_t mSyllable = 0, mAt = 0, mPause = 0;
     double mPeak = 0.0;

@@ -14,8 +14,11 @@ namespace host {
 
 namespace {
 constexpr double kPi = 3.14159265358979323846;
-// FFTW's planner is not thread-safe; executing a plan is.
+// FFTW's planner is not thread-safe; executing a plan is. The lock keeps this program's
+// windows apart; FFTW's own (made safe below) keeps them apart from plans that the
+// platform's routes make in other threads.
 std::mutex gPlanner;
+std::once_flag gPlannerSafe;
 }  // namespace
 
 SpectrumWindow::SpectrumWindow(int length, int referenceCount)
@@ -25,6 +28,7 @@ SpectrumWindow::SpectrumWindow(int length, int referenceCount)
     const double scale = 4.0 / length;
     for (int i = 0; i < length; ++i)
         mWindow[static_cast<size_t>(i)] = static_cast<float>(scale * 0.5 * (1.0 - std::cos(2.0 * kPi * (i + 0.5) / length)));
+    std::call_once(gPlannerSafe, [] { fftwf_make_planner_thread_safe(); });
     std::lock_guard<std::mutex> lock(gPlanner);
     mIn = fftwf_alloc_real(static_cast<size_t>(length));
     auto* out = fftwf_alloc_complex(static_cast<size_t>(bins()));

@@ -7,8 +7,10 @@
 #include <atomic>
 #include <cmath>
 #include <cstdint>
+#include <unistd.h>
 
 #include "routes/RouteBackend.h"
+#include "routes/sim/SimAcoustics.h"
 #include "routes/sim/SimRoomClock.h"
 #include "routes/sim/SimRoomConfig.h"
 #include "routes/sim/SimRoomLayout.h"
@@ -62,10 +64,16 @@ private:
     std::atomic<bool> mGone{false};
 };
 
+// Room samples (full scale 1) to the ring's int16, clipped at full scale as a converter does.
+void toRing(const float* in, long count, int16_t* out) {
+    for (long i = 0; i < count; ++i) out[i] = int16_t(std::nearbyint(std::clamp(double(in[i]) * 32768.0, -32768.0, 32767.0)));
+}
+
 class SimOutputRoute : public OutputRoute {
 public:
-    explicit SimOutputRoute(std::unique_ptr<RoomMembership> room)
+    SimOutputRoute(std::unique_ptr<RoomMembership> room, std::unique_ptr<sim::SpeakerAcoustics> acoustics)
         : mRoom(std::move(room)),
+          mAcoustics(std::move(acoustics)),
           // A slot left by an earlier speaker may reach into the future; continue after it.
           mNext(mRoom->slot().end.load(std::memory_order_relaxed)) {}
 
@@ -82,8 +90,15 @@ public:
             const size_t n = std::min(count, kChunk);
             const int64_t now = sim::timelineNow();
             if (mNext < now + kResyncMargin) mNext = now + sim::kLatencySamples;
-            sim::placeSamples(mRoom->slot(), mNext, samples, n);
-            mNext += int64_t(n);
+            size_t placed = n;
+            if (mAcoustics) {
+                placed = size_t(mAcoustics->play(samples, long(n), mRoomSamples));
+                toRing(mRoomSamples, long(placed), mPlaced);
+                sim::placeSamples(mRoom->slot(), mNext, mPlaced, placed);
+            } else {
+                sim::placeSamples(mRoom->slot(), mNext, samples, n);
+            }
+            mNext += int64_t(placed);
             samples += n;
             count -= n;
             // Ready for more when exactly the latency is left queued.
@@ -97,18 +112,29 @@ public:
 
 private:
     std::unique_ptr<RoomMembership> mRoom;
+    std::unique_ptr<sim::SpeakerAcoustics> mAcoustics;  // none in today's ideal room
+    float mRoomSamples[kChunk + 64];
+    int16_t mPlaced[kChunk + 64];
     int64_t mNext;  // timeline position of the next sample to write
     sim::TimelineWaiter mWaiter;
     Presence mPresence;
 };
 
-class SimCaptureRoute : public CaptureRoute {
+class SimCaptureRoute : public CaptureRoute, private acoustics::ClockDrift::Source {
 public:
-    SimCaptureRoute(std::unique_ptr<RoomMembership> room, const sim::MicSettings& settings)
+    SimCaptureRoute(std::unique_ptr<RoomMembership> room, const sim::MicSettings& settings,
+                    std::unique_ptr<sim::RoomHearing> hearing)
         : mRoom(std::move(room)),
           mGain(std::pow(10.0, settings.gainDb / 20.0)),
           mNoiseRms(settings.noiseDbfs ? 32768.0 * std::pow(10.0, *settings.noiseDbfs / 20.0) : 0.0),
-          mNoise(settings.seed) {}
+          mNoise(settings.seed),
+          mHearing(std::move(hearing)) {}
+
+    // A microphone whose device clock is off the room's.
+    bool setClock(double ppm, std::string* error) {
+        mClock = acoustics::ClockDrift::forMicrophone(ppm, this, error);
+        return mClock != nullptr;
+    }
 
     int open(uint32_t sampleRate) override {
         if (!checkRate(sampleRate, "microphone")) return android::BAD_VALUE;
@@ -122,6 +148,7 @@ public:
         if (!mOpened) return android::NO_INIT;
         const int64_t now = sim::timelineNow();
         if (!mPresence.ok(*mRoom, now)) return android::DEAD_OBJECT;
+        if (mClock) return readThroughClock(out, count);
         if (now - mReadPos > kMaxBacklog) mReadPos = now;
         size_t n = count;
         if (!mWaiter.waitFor(mReadPos + int64_t(count))) {
@@ -141,26 +168,68 @@ public:
     std::string failure() const override { return mPresence.failure(); }
 
 private:
+    // The device's converter samples the room at its own clock: the room's sound is taken a
+    // piece at a time, as the timeline reaches it (fetch below).
+    ssize_t readThroughClock(int16_t* out, size_t count) {
+        size_t done = 0;
+        while (done < count) {
+            float device[kChunk];
+            const long want = long(std::min(count - done, kChunk));
+            const long got = mClock->pull(device, want);
+            if (got <= 0) break;
+            finish(device, size_t(got), out + done);
+            done += size_t(got);
+            if (got < want) break;
+        }
+        return ssize_t(done);
+    }
+
+    long fetch(float** data) override {
+        const int64_t now = sim::timelineNow();
+        if (now - mReadPos > kMaxBacklog) mReadPos = now;
+        long n = long(kChunk);
+        if (!mWaiter.waitFor(mReadPos + n)) n = long(std::clamp<int64_t>(sim::timelineNow() - mReadPos, 0, n));
+        if (n > 0) mHearing->hear(mRoom->layout(), mReadPos, int(n), mFetched);
+        mReadPos += n;
+        *data = mFetched;
+        return n;
+    }
+
     // Mixes every speaker over [position, position + count), count <= kChunk.
     void hear(int64_t position, size_t count, int16_t* out) {
+        if (mHearing) {
+            float room[kChunk];
+            mHearing->hear(mRoom->layout(), position, int(count), room);
+            finish(room, count, out);
+            return;
+        }
         int32_t mix[kChunk] = {};
         int16_t scratch[kChunk];
         for (const sim::SpeakerSlot& slot : mRoom->layout().slots) {
             const sim::SlotSpan span = sim::readSamples(slot, position, count, scratch);
             for (int64_t p = span.from; p < span.to; ++p) mix[p - position] += scratch[p - position];
         }
-        for (size_t i = 0; i < count; ++i) {
-            double v = double(mix[i]) * mGain;
-            if (mNoiseRms > 0.0) v += mNoiseRms * mNoise.next();
-            v = std::nearbyint(std::clamp(v, -32768.0, 32767.0));
-            out[i] = int16_t(v);
-        }
+        for (size_t i = 0; i < count; ++i) out[i] = toSample(double(mix[i]));
+    }
+
+    // The microphone's gain and own noise, then its converter's full scale.
+    void finish(const float* room, size_t count, int16_t* out) {
+        for (size_t i = 0; i < count; ++i) out[i] = toSample(double(room[i]) * 32768.0);
+    }
+
+    int16_t toSample(double v) {
+        v *= mGain;
+        if (mNoiseRms > 0.0) v += mNoiseRms * mNoise.next();
+        return int16_t(std::nearbyint(std::clamp(v, -32768.0, 32767.0)));
     }
 
     std::unique_ptr<RoomMembership> mRoom;
     const double mGain;
     const double mNoiseRms;
     sim::NoiseSource mNoise;
+    std::unique_ptr<sim::RoomHearing> mHearing;     // none in today's ideal room
+    std::unique_ptr<acoustics::ClockDrift> mClock;  // none on the room's clock
+    float mFetched[kChunk];
     int64_t mReadPos = 0;  // timeline position of the next sample to deliver
     bool mOpened = false;
     sim::TimelineWaiter mWaiter;
@@ -169,6 +238,7 @@ private:
 
 bool checkSimRoute(const std::string& room, bool speaker, std::string* reason) {
     if (!speaker && !sim::micSettingsFromEnv(reason)) return false;
+    if (!sim::acousticSettingsFromEnv(reason)) return false;
     return RoomMembership::check(room, speaker ? RoomMembership::Role::Speaker : RoomMembership::Role::Microphone,
                                  reason);
 }
@@ -181,15 +251,31 @@ std::unique_ptr<CaptureRoute> makeSimCaptureRoute(const std::string& room, std::
     if (!sim::validateRoomName(room, error)) return nullptr;
     const std::optional<sim::MicSettings> settings = sim::micSettingsFromEnv(error);
     if (!settings) return nullptr;
+    const std::optional<sim::AcousticSettings> acoustics = sim::acousticSettingsFromEnv(error);
+    if (!acoustics) return nullptr;
+    std::unique_ptr<sim::RoomHearing> hearing;
+    if (!acoustics->ideal()) {
+        hearing = sim::RoomHearing::make(*acoustics, settings->seed, sim::processIdentity(getpid()), error);
+        if (!hearing) return nullptr;
+    }
     auto membership = RoomMembership::join(room, RoomMembership::Role::Microphone, error);
     if (!membership) return nullptr;
-    return std::make_unique<SimCaptureRoute>(std::move(membership), *settings);
+    auto route = std::make_unique<SimCaptureRoute>(std::move(membership), *settings, std::move(hearing));
+    if (acoustics->clockPpm != 0.0 && !route->setClock(acoustics->clockPpm, error)) return nullptr;
+    return route;
 }
 
 std::unique_ptr<OutputRoute> makeSimOutputRoute(const std::string& room, std::string* error) {
+    const std::optional<sim::AcousticSettings> acoustics = sim::acousticSettingsFromEnv(error);
+    if (!acoustics) return nullptr;
+    std::unique_ptr<sim::SpeakerAcoustics> speaker;
+    if (!acoustics->ideal()) {
+        speaker = sim::SpeakerAcoustics::make(*acoustics, error);
+        if (!speaker) return nullptr;
+    }
     auto membership = RoomMembership::join(room, RoomMembership::Role::Speaker, error);
     if (!membership) return nullptr;
-    return std::make_unique<SimOutputRoute>(std::move(membership));
+    return std::make_unique<SimOutputRoute>(std::move(membership), std::move(speaker));
 }
 
 }  // namespace

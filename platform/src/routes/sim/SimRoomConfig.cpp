@@ -4,6 +4,7 @@
 
 #include <cerrno>
 #include <cmath>
+#include <cstdio>
 #include <cstdlib>
 
 namespace korvo {
@@ -17,6 +18,10 @@ constexpr double kMinGainDb = -120.0;
 constexpr double kMaxGainDb = 40.0;
 constexpr double kMinNoiseDbfs = -150.0;
 constexpr double kMaxNoiseDbfs = 0.0;
+// A crystal is off by tens of ppm; more than a thousand is no clock.
+constexpr double kMaxClockPpm = 1000.0;
+constexpr double kMinDistanceM = 0.1;
+constexpr double kMaxDistanceM = 100.0;
 
 // Error texts stay on one line whatever the user typed.
 std::string printable(const std::string& text) {
@@ -25,6 +30,13 @@ std::string printable(const std::string& text) {
         if (static_cast<unsigned char>(c) < 0x20 || c == 0x7f) c = '?';
     }
     return out;
+}
+
+// 40, -120, 0.1: as a person writes them.
+std::string shortNumber(double v) {
+    char text[32];
+    snprintf(text, sizeof text, "%g", v);
+    return text;
 }
 
 const char* envValue(const char* name) {
@@ -59,7 +71,7 @@ bool readLevel(const char* name, double lo, double hi, const char* what, double*
     if (!parseNumber(text, &v) || v < lo || v > hi) {
         if (error) {
             *error = std::string(name) + "='" + printable(text) + "' is not " + what + " between " +
-                     std::to_string(int(lo)) + " and " + std::to_string(int(hi));
+                     shortNumber(lo) + " and " + shortNumber(hi);
         }
         return false;
     }
@@ -107,6 +119,35 @@ std::optional<MicSettings> micSettingsFromEnv(std::string* error) {
             return std::nullopt;
         }
     }
+    return s;
+}
+
+bool AcousticSettings::ideal() const {
+    return std::string(room->name) == "quiet" && std::string(device->name) == "ideal" && clockPpm == 0.0 &&
+           distanceM == 1.0 && musicFile.empty();
+}
+
+std::optional<AcousticSettings> acousticSettingsFromEnv(std::string* error) {
+    AcousticSettings s;
+    const char* room = envValue("KORVO_SIM_ROOM");
+    s.room = acoustics::findRoomPreset(room ? room : "quiet");
+    if (!s.room) {
+        if (error) *error = "KORVO_SIM_ROOM='" + printable(room) + "' is not a room (" + acoustics::roomPresetNames() + ")";
+        return std::nullopt;
+    }
+    const char* device = envValue("KORVO_SIM_DEVICE");
+    s.device = acoustics::findDevicePreset(device ? device : "ideal");
+    if (!s.device) {
+        if (error) *error = "KORVO_SIM_DEVICE='" + printable(device) + "' is not a device (" + acoustics::devicePresetNames() + ")";
+        return std::nullopt;
+    }
+    s.clockPpm = s.device->clockPpm;
+    s.distanceM = s.room->distanceM;
+    if (!readLevel("KORVO_SIM_CLOCK_PPM", -kMaxClockPpm, kMaxClockPpm, "a clock offset in ppm", &s.clockPpm, error) ||
+        !readLevel("KORVO_SIM_DISTANCE", kMinDistanceM, kMaxDistanceM, "a distance in metres", &s.distanceM, error)) {
+        return std::nullopt;
+    }
+    if (const char* music = envValue("KORVO_SIM_MUSIC")) s.musicFile = music;
     return s;
 }
 
