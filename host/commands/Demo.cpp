@@ -10,6 +10,7 @@
 
 #include <CLI/CLI.hpp>
 
+#include <korvo/platform/RoomPresets.h>
 #include <korvo/platform/Routes.h>
 
 #include "host/base/Clock.h"
@@ -36,6 +37,8 @@ struct DemoOptions {
     int timeoutMs = 8000;
     LevelChoice level;
     DecoderKind decoder = DecoderKind::Host;
+    std::string room;     // a room preset of the simulated room; empty: the environment's
+    std::string devices;  // a device preset for both devices; empty: the environment's
 };
 
 // In noise the room carries the speakers to the microphones 20 dB down, so that the
@@ -68,6 +71,7 @@ public:
         RouteUse routes;
         routes.mic = routes.speaker = true;
         if (int status = checkRouteTexts(routes, mMic, mSpeaker)) return status;
+        if (!presetsApply()) return 2;
         if (!roomsFree()) return 2;
         mRounds.start(monotonicMs());
         std::string noise = "no noise";
@@ -78,9 +82,18 @@ public:
             noise = text;
         }
         const std::string where = freshRoom ? "in room " + mRoom : "on mic " + mMic + ", speaker " + mSpeaker;
-        infof("demo %s: %s, acknowledgement %s, tones of %d ms, %s, %s decision%s\n", shown(where).c_str(),
+        std::string presets;
+        if (!mOpt.room.empty()) presets += ", room " + mOpt.room;
+        if (!mOpt.devices.empty()) presets += ", devices " + mOpt.devices;
+        mCodes = carriedCodes();
+        if (mCodes < kBuiltinCodes) {
+            presets += ", codes 0.." + std::to_string(mCodes - 1) + " (the " + mOpt.devices + "'s loudspeaker carries none above " +
+                       std::to_string(int(korvo::platform::devicePresetTopHz(mOpt.devices))) + " Hz)";
+        }
+        infof("demo %s: %s, acknowledgement %s, tones of %d ms, %s, %s decision%s%s\n", shown(where).c_str(),
               plural(mOpt.rounds, "round").c_str(), mOpt.noAck ? "off" : "on", mOpt.toneMs, noise.c_str(),
-              decoderName(mOpt.decoder), levelArgument().empty() ? "" : (", " + levelArgument().substr(2)).c_str());
+              decoderName(mOpt.decoder), levelArgument().empty() ? "" : (", " + levelArgument().substr(2)).c_str(),
+              presets.c_str());
 
         // Both start together and calibrate at once; they begin when both are ready.
         const bool started = startDevice(kListener) && startDevice(kSpeaker);
@@ -92,6 +105,28 @@ public:
     }
 
 private:
+    // A room's or a device's preset is the simulated room's: a sound card has its own.
+    bool presetsApply() const {
+        if (mOpt.room.empty() && mOpt.devices.empty()) return true;
+        for (const std::string& route : {mMic, mSpeaker}) {
+            if (route.compare(0, 4, "sim:") != 0) {
+                errf("%s applies to simulated rooms only, not to %s", mOpt.room.empty() ? "--devices" : "--room",
+                     shown(route).c_str());
+                return false;
+            }
+        }
+        return true;
+    }
+
+    // The handshake's codes that the devices' loudspeakers carry: those at or below the
+    // preset's top frequency.
+    int carriedCodes() const {
+        const double top = mOpt.devices.empty() ? 0.0 : korvo::platform::devicePresetTopHz(mOpt.devices);
+        int codes = kBuiltinCodes;
+        while (top > 0.0 && codes > 0 && korvo::codeHz(codes - 1) > top) --codes;
+        return codes;
+    }
+
     // Speakers of another run in a room would mix their codes with this demo's, and both
     // runs would fail rounds without knowing why. A monitor only listens: it is welcome.
     bool roomsFree() {
@@ -114,17 +149,27 @@ private:
     }
 
     bool startDevice(Who who) {
+        EnvList env;
         std::vector<std::string> args = {"soundmeter", "handshake", "--role", kWhoName[who],
                                          "--rounds", std::to_string(mOpt.rounds), "--tone-ms",
                                          std::to_string(mOpt.toneMs), "--timeout-ms", std::to_string(mOpt.timeoutMs),
                                          "--mic", mMic, "--speaker", mSpeaker};
         if (mOpt.noAck) args.push_back("--no-ack");
+        if (mCodes < kBuiltinCodes) args.push_back("--codes=" + std::to_string(mCodes));
+        if (!mOpt.room.empty()) env.emplace_back("KORVO_SIM_ROOM", mOpt.room);
+        if (!mOpt.devices.empty()) {
+            env.emplace_back("KORVO_SIM_DEVICE", mOpt.devices);
+            // Two devices of one make are not on one clock: their crystals are off in opposite
+            // directions, the speaker's as the preset says, the listener's the other way.
+            char ppm[32];
+            snprintf(ppm, sizeof ppm, "%g", (who == kSpeaker ? 1 : -1) * korvo::platform::devicePresetClockPpm(mOpt.devices));
+            env.emplace_back("KORVO_SIM_CLOCK_PPM", ppm);
+        }
         args.push_back(std::string("--decoder=") + decoderName(mOpt.decoder));
         args.push_back("--start-on-stdin");
         if (!levelArgument().empty()) args.push_back(levelArgument());
         for (int i = 0; i < mCommon.verbose; ++i) args.push_back("-v");
         if (!mCommon.plugin.empty()) args.push_back("--plugin=" + mCommon.plugin);
-        EnvList env;
         // Each device's microphone hears noise of its own, new in every run.
         env.emplace_back("KORVO_SIM_SEED", std::to_string(2 * (getpid() % 1000000) + who + 1));
         // The demo decides the noise: none unless --snr asks for it (an empty value is none).
@@ -228,6 +273,7 @@ private:
     DemoRounds mRounds;
     bool mReady[2] = {false, false};
     bool mCrowded = false;  // another run's speakers came into the room
+    int mCodes = kBuiltinCodes;  // the handshake's codes the loudspeakers carry
 };
 
 }  // namespace
@@ -262,6 +308,14 @@ Command addDemoCommand(CLI::App& app, CommonOptions& common) {
     addLevelOption(sub, &options->level,
                    "the devices' detection level, for --decoder builtin (default: auto with --snr, else the plug-in's)");
     addDecoderOption(sub, &options->decoder);
+    sub->add_option("--room", options->room,
+                    "the simulated room's situation: reverberation, distance and background sounds (README: Simulated "
+                    "rooms; default: KORVO_SIM_ROOM, else quiet)")
+        ->check(CLI::IsMember(korvo::platform::roomPresets()));
+    sub->add_option("--devices", options->devices,
+                    "both devices' loudspeakers, microphones and clocks (README: Simulated rooms; default: "
+                    "KORVO_SIM_DEVICE, else ideal)")
+        ->check(CLI::IsMember(korvo::platform::devicePresets()));
     // Both devices use these routes instead of the fresh room (e.g. sim:lab, which a monitor can join).
     addRouteOptions(sub, common, "the fresh room", "the fresh room");
     return {sub, [&common, options] {

@@ -16,26 +16,26 @@ const ResponseSpec kPhoneMicrophone{100.0, 2, 20000.0, 2, 12000.0, 3.0, 2.0};
 
 const std::vector<DevicePreset>& devicePresets() {
     static const std::vector<DevicePreset> presets = {
-        {"ideal", kFlat, kFlat, -400.0, -400.0, 0.0, 0.0,
+        {"ideal", kFlat, kFlat, -400.0, -400.0, 0.0, 0.0, 0.0,
          "today's device: flat, clean, on the room's clock, hearing itself as it hears the others"},
         {"phone",
          {400.0, 2, 18000.0, 4, 4000.0, 5.0, 2.0},
          kPhoneMicrophone,
-         -40.0, -44.0, 20.0, 0.12,
+         -40.0, -44.0, 20.0, 0.12, 18000.0,
          "a phone: a micro-speaker that moves little air below 400 Hz and falls steeply above 18 kHz, "
          "with a resonance near 4 kHz; about 1.2 % distortion at full volume; a MEMS microphone with "
          "its port's resonance near 12 kHz; a crystal 20 ppm fast; its microphone 12 cm from its speaker"},
         {"laptop",
          {300.0, 2, 17000.0, 4, 2500.0, 4.0, 1.5},
          {100.0, 2, 18000.0, 4, 0.0, 0.0, 1.0},
-         -34.0, -36.0, -50.0, 0.25,
+         -34.0, -36.0, -50.0, 0.25, 17000.0,
          "a laptop: small side-firing speakers falling above 17 kHz, a cabinet resonance near 2.5 kHz, "
          "about 2.5 % distortion at full volume; a microphone behind a grille, falling above 18 kHz; "
          "a clock 50 ppm slow; its microphone 25 cm from its speakers"},
         {"cheap-speaker",
          {800.0, 4, 12000.0, 4, 3000.0, 6.0, 1.5},
          kPhoneMicrophone,
-         -24.0, -22.0, 100.0, 0.3,
+         -24.0, -22.0, 100.0, 0.3, 12000.0,
          "a cheap loudspeaker: a small cone that cannot play above 12 kHz nor below 800 Hz, a strong "
          "resonance near 3 kHz and about 10 % distortion at full volume; a phone's microphone; a "
          "cheap crystal 100 ppm fast; 30 cm between them"},

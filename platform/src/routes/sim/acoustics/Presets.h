@@ -20,6 +20,9 @@ struct DevicePreset {
     double thirdDb;
     double clockPpm;       // how fast the device's clock runs against the room's
     double selfDistanceM;  // its own loudspeaker to its own microphone; 0: as far as any other
+    // The highest frequency its loudspeaker carries a code at: its low-pass corner, where the
+    // level is 3 dB down and falls 24 dB an octave; 0: every code.
+    double topHz;
     const char* why;
 };
 
