@@ -74,6 +74,23 @@ TEST(HostDemo, InNoiseWithAndWithoutAcknowledgementAndDrownedByIt) {
               std::string::npos) << r.err;
 }
 
+TEST(HostDemo, InAnOfficeAndAKitchenWithTheCodesTheLoudspeakersCarry) {
+    ProcessResult r = runHost(kHost, {"demo", "--room", "office", "--devices", "phone", "--rounds", "4"}, kRunMs);
+    EXPECT_EQ(r.status, 0) << r.out << r.err;
+    EXPECT_NE(r.out.find(", room office, devices phone\n"), std::string::npos) << r.out;
+    EXPECT_NE(r.out.find("4 of 4 exchanges completed"), std::string::npos) << r.out;
+    // A loudspeaker that plays nothing above 12 kHz keeps the exchange to codes 0..10.
+    r = runHost(kHost, {"demo", "--room", "kitchen", "--devices", "cheap-speaker", "--rounds", "12", "--no-ack"}, kRunMs);
+    EXPECT_EQ(r.status, 0) << r.out << r.err;
+    EXPECT_NE(r.out.find("codes 0..10 (the cheap-speaker's loudspeaker carries none above 12000 Hz)"), std::string::npos) << r.out;
+    EXPECT_NE(r.out.find("says  code  0 ( 2580 Hz)"), std::string::npos) << r.out;
+    EXPECT_EQ(r.out.find("says  code 11"), std::string::npos) << r.out;
+    // Presets are the simulated room's: a demo on another route is refused.
+    r = runHost(kHost, {"demo", "--room", "hall", "--mic", "null"}, kRunMs);
+    EXPECT_EQ(r.status, 2);
+    EXPECT_EQ(r.err, "soundmeter: --room applies to simulated rooms only, not to null\n");
+}
+
 TEST(HostDemo, ADeviceThatStopsRespondingEndsTheDemo) {
     HostProcess demo(kHost);
     ASSERT_TRUE(demo.start({"demo", "--rounds", "20", "--timeout-ms", "1000", "--tone-ms", "300"}));
