@@ -201,28 +201,40 @@ bool FrameDecoder::begins(int code, Track& t) {
         t.holdWindows = std::max(w + 1, 2);
         t.misses = 0;
         t.endLevel = 0.0;
+        t.peakLevel = p.power;
+        t.fell = false;
         return true;
     }
     return false;
 }
 
-void FrameDecoder::holdOrEnd(int code, Track& t) {
+bool FrameDecoder::holdOrEnd(int code, Track& t) {
     double level = 0.0;
+    bool held = false;
     for (int w = 0; w < t.holdWindows; ++w) {
         const Peak p = find(w, code, mRanges[static_cast<size_t>(w)][static_cast<size_t>(code)].hold);
         if (p.bin < 0) continue;
         level = std::max(level, p.power);
-        if (p.ratio >= mRanges[static_cast<size_t>(w)][static_cast<size_t>(code)].hold) {
-            t.misses = 0;
-            t.endLevel = 0.0;
-            return;
+        held = held || p.ratio >= mRanges[static_cast<size_t>(w)][static_cast<size_t>(code)].hold;
+    }
+    if (held) {
+        t.misses = 0;
+        t.endLevel = 0.0;
+        if (level < kFallFactor * t.peakLevel) t.fell = true;
+        if (t.fell && level >= kRiseFactor * t.peakLevel) {
+            t.fell = false;
+            t.peakLevel = level;
+            return true;
         }
+        if (!t.fell) t.peakLevel = std::max(t.peakLevel, level);
+        return false;
     }
     t.endLevel = std::max(t.endLevel, level);
     if (++t.misses >= kReleaseFrames) {
         t.sounding = false;
         t.sinceEnd = 0;
     }
+    return false;
 }
 
 bool FrameDecoder::live(int length) const {
@@ -253,7 +265,7 @@ CodeSet FrameDecoder::addFrame(const int16_t* samples) {
         Track& t = mTracks[static_cast<size_t>(c)];
         if (t.sinceEnd >= 0) ++t.sinceEnd;
         if (t.sounding) {
-            holdOrEnd(c, t);
+            if (holdOrEnd(c, t)) began |= codeBit(c);
         } else if (begins(c, t)) {
             began |= codeBit(c);
         }

@@ -81,6 +81,13 @@ public:
     // must stand kReturnFactor above where such a fade would have left the ended sounding.
     static constexpr double kMaxReverbSeconds = 3.0;
     static constexpr double kReturnFactor = 10.0;  // 10 dB in power: an echo regrows after its dips by less
+    // Where the noise floor is far down (a hall without noise) a code's reverberant tail
+    // stays above the hold threshold for seconds, and the same code said again meanwhile
+    // would never be reported. A sounding whose line has fallen kFallFactor below its peak
+    // and then comes back to within kRiseFactor of it has begun again: a tail does not
+    // regrow by 14 dB (see kReturnFactor).
+    static constexpr double kFallFactor = 0.01;  // 20 dB in power
+    static constexpr double kRiseFactor = 0.25;  // 6 dB
     // Talk-off. Windows from 1024 on begin a code only when their previous analysis read its
     // peak within kSteadyBins (recorded speech: 360 false codes an hour without, 52 at 0.3
     // bin, 0 at 0.15; the price: 40 ms tones at -10 dB SNR heard 97.0 -> 93.3 %); the
@@ -134,6 +141,8 @@ private:
         int holdWindows = 0;  // windows [0, holdWindows) keep it sounding
         int misses = 0;
         double endLevel = 0.0;
+        double peakLevel = 0.0;  // the loudest its line has been while sounding
+        bool fell = false;       // its line fell kFallFactor below that since
         int64_t sinceEnd = -1;  // frames since its last end, -1 for never
     };
 
@@ -149,7 +158,8 @@ private:
     bool pureLine(int window, const SpectrumWindow& w, const Peak& p) const;
     static double returnLevel(const Track& t);
     bool begins(int code, Track& t);
-    void holdOrEnd(int code, Track& t);
+    // Whether the sounding goes on, and true when it has begun again.
+    bool holdOrEnd(int code, Track& t);
 
     std::vector<std::unique_ptr<SpectrumWindow>> mWindows;
     std::array<std::array<Range, kCodes>, kWindows> mRanges{};
