@@ -119,8 +119,9 @@ RealTimeCheck checkRealTime(const Point& p, int tones, const std::string& soundm
 
     // Live.
     std::ostringstream command;
-    command << "'" << soundmeter << "' listen --json --seconds 0 --level auto --decoder " << host::decoderName(p.decoder)
-            << " --mic 'wav:" << path << "'";
+    // The builtin decoder calibrates its level on the room first, as the offline listener did.
+    command << "'" << soundmeter << "' listen --json --seconds 0" << (host::decoderInfo(p.decoder).takesLevel ? " --level auto" : "")
+            << " --decoder " << host::decoderName(p.decoder) << " --mic 'wav:" << path << "'";
     std::unique_ptr<FILE, int (*)(FILE*)> pipe(popen(command.str().c_str(), "r"), pclose);
     if (!pipe) {
         r.error = "cannot run " + soundmeter;

@@ -1,10 +1,11 @@
-// korvo_envelope: the operating envelope of the link, measured on the offline listener
-// (the library's analysis and detection with a live listener's timing) and checked
-// against real-time runs of `soundmeter listen` at a few points. Run by hand
-// (scripts/envelope.sh; about 20 minutes on two cores): it writes CSV files and
+// korvo_envelope: the operating envelope of the link for both decoders, measured offline (the
+// host's frame decoder on every frame; the builtin one on the library's analysis and detection
+// with a live listener's timing) and checked against real-time runs of `soundmeter listen` at
+// a few points. Run by hand
+// (scripts/envelope.sh; about 40 minutes on two cores): it writes CSV files and
 // gnuplot's PNG plots into the output folder.
 //
-//   korvo_envelope [--out DIR] [--trials N] [--quick] [--no-realtime] [--soundmeter PATH]
+//   korvo_envelope [--out DIR] [--trials N] [--quick] [--no-realtime | --realtime-only] [--soundmeter PATH]
 #include <unistd.h>
 
 #include <algorithm>
@@ -32,12 +33,13 @@ struct Settings {
     int trials = 300;
     bool quick = false;
     bool realtime = true;
+    bool realtimeOnly = false;  // only the real-time check (its CSV), not the grids
     std::string soundmeter;
     unsigned threads = std::max(1u, std::thread::hardware_concurrency());
 };
 
 // Grids around the 99 % thresholds of both decoders: 300 trials at every point of them fit
-// in about an hour and a half on two cores.
+// in about 40 minutes on two cores.
 const std::vector<double> kSnrs = {20, 10, 0, -5, -8, -10, -12, -14, -16, -18, -20};
 // Speech-like noise is pink and pauses between syllables: it holds far less power at the
 // codes' frequencies than its full-band figure says, so its grid reaches further down.
@@ -247,6 +249,9 @@ std::string selfFolder() {
     return s.substr(0, s.rfind('/'));
 }
 
+void measureGrids(const Settings& s, const std::vector<double>& snrs, const std::vector<double>& speechSnrs);
+void checkRealTimes(const Settings& s);
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -261,10 +266,12 @@ int main(int argc, char** argv) {
             s.quick = true;
         } else if (a == "--no-realtime") {
             s.realtime = false;
+        } else if (a == "--realtime-only") {
+            s.realtimeOnly = true;
         } else if (a == "--soundmeter" && i + 1 < argc) {
             s.soundmeter = argv[++i];
         } else {
-            fprintf(stderr, "usage: korvo_envelope [--out DIR] [--trials N] [--quick] [--no-realtime] [--soundmeter PATH]\n");
+            fprintf(stderr, "usage: korvo_envelope [--out DIR] [--trials N] [--quick] [--no-realtime | --realtime-only] [--soundmeter PATH]\n");
             return 2;
         }
     }
@@ -277,6 +284,18 @@ int main(int argc, char** argv) {
 
     const std::vector<double> snrs = s.quick ? std::vector<double>{10, 0, -10} : kSnrs;
     const std::vector<double> speechSnrs = s.quick ? std::vector<double>{10, -10, -30} : kSpeechSnrs;
+    if (!s.realtimeOnly) measureGrids(s, snrs, speechSnrs);
+    if (s.realtime) checkRealTimes(s);
+
+    const std::string plot = "gnuplot -e \"dir='" + s.out + "'\" '" + KORVO_ENVELOPE_PLOTS + "'";
+    if (system(plot.c_str()) != 0) fprintf(stderr, "korvo_envelope: gnuplot failed (scripts/install-deps.sh envelope installs it)\n");
+    fprintf(stderr, "wrote %s\n", s.out.c_str());
+    return 0;
+}
+
+namespace {
+
+void measureGrids(const Settings& s, const std::vector<double>& snrs, const std::vector<double>& speechSnrs) {
     const auto white300 = measure(1, Noise::White, 300, snrs, s);
     writePoints(s, "heard-white-300ms.csv", white300);
     writeAggregate(s, "codes-white-300ms.csv", white300, false);
@@ -312,30 +331,28 @@ int main(int argc, char** argv) {
         }
     }
     fclose(f);
-
-    if (s.realtime) {
-        std::vector<Point> checks(3);
-        checks[0].code = 5, checks[0].toneMs = 300, checks[0].snrDb = -10, checks[0].seed = 501;
-        checks[1].code = 17, checks[1].toneMs = 40, checks[1].snrDb = 0, checks[1].seed = 502;
-        checks[2].code = 10, checks[2].toneMs = 300, checks[2].snrDb = 10, checks[2].seed = 503;
-        checks[2].decoder = DecoderKind::Builtin;
-        FILE* r = openCsv(s, "realtime-check.csv",
-                          "decoder,noise,tone_ms,code,snr_db,tones,heard_live,heard_simulated,latency_median_live_ms,"
-                          "latency_median_simulated_ms,latency_p99_live_ms,latency_p99_simulated_ms");
-        for (const Point& p : checks) {
-            fprintf(stderr, "real time: code %d, %.0f ms, %.0f dB SNR, %s decision\n", p.code, p.toneMs, p.snrDb,
-                    korvo::host::decoderName(p.decoder));
-            const RealTimeCheck c = checkRealTime(p, s.quick ? 10 : 60, s.soundmeter, s.out);
-            if (!c.error.empty()) fprintf(stderr, "korvo_envelope: %s\n", c.error.c_str());
-            fprintf(r, "%s,%s,%.0f,%d,%.1f,%d,%d,%.1f,%.1f,%.1f,%.1f,%.1f\n", korvo::host::decoderName(p.decoder),
-                    noiseName(p.noise), p.toneMs, p.code, p.snrDb, c.tones, c.heardLive, c.heardSimulated, c.medianLiveMs,
-                    c.medianSimulatedMs, c.p99LiveMs, c.p99SimulatedMs);
-        }
-        fclose(r);
-    }
-
-    const std::string plot = "gnuplot -e \"dir='" + s.out + "'\" '" + KORVO_ENVELOPE_PLOTS + "'";
-    if (system(plot.c_str()) != 0) fprintf(stderr, "korvo_envelope: gnuplot failed (scripts/install-deps.sh envelope installs it)\n");
-    fprintf(stderr, "wrote %s\n", s.out.c_str());
-    return 0;
 }
+
+// A few points heard live by `soundmeter listen` on a recording, against the offline listener.
+void checkRealTimes(const Settings& s) {
+    std::vector<Point> checks(3);
+    checks[0].code = 5, checks[0].toneMs = 300, checks[0].snrDb = -10, checks[0].seed = 501;
+    checks[1].code = 17, checks[1].toneMs = 40, checks[1].snrDb = 0, checks[1].seed = 502;
+    checks[2].code = 10, checks[2].toneMs = 300, checks[2].snrDb = 10, checks[2].seed = 503;
+    checks[2].decoder = DecoderKind::Builtin;
+    FILE* r = openCsv(s, "realtime-check.csv",
+                      "decoder,noise,tone_ms,code,snr_db,tones,heard_live,heard_simulated,latency_median_live_ms,"
+                      "latency_median_simulated_ms,latency_p99_live_ms,latency_p99_simulated_ms");
+    for (const Point& p : checks) {
+        fprintf(stderr, "real time: code %d, %.0f ms, %.0f dB SNR, %s decision\n", p.code, p.toneMs, p.snrDb,
+                korvo::host::decoderName(p.decoder));
+        const RealTimeCheck c = checkRealTime(p, s.quick ? 10 : 60, s.soundmeter, s.out);
+        if (!c.error.empty()) fprintf(stderr, "korvo_envelope: %s\n", c.error.c_str());
+        fprintf(r, "%s,%s,%.0f,%d,%.1f,%d,%d,%.1f,%.1f,%.1f,%.1f,%.1f\n", korvo::host::decoderName(p.decoder),
+                noiseName(p.noise), p.toneMs, p.code, p.snrDb, c.tones, c.heardLive, c.heardSimulated, c.medianLiveMs,
+                c.medianSimulatedMs, c.p99LiveMs, c.p99SimulatedMs);
+    }
+    fclose(r);
+}
+
+}  // namespace

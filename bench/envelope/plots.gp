@@ -29,7 +29,7 @@ do for [g in 'white-300ms white-40ms speech-300ms'] {
 
 # Per code: the lowest SNR heard in 99 % of trials (300 ms tones).
 set output dir.'/threshold-snr.png'
-set title 'Lowest SNR at which each code is heard in 99 % of 300 ms tones (lower is better; dashed: target -10 dB)'
+set title 'Lowest SNR at which each code is heard in 99 % of 300 ms tones (lower is better; dashed: target -18 dB)'
 set xlabel 'code'
 set ylabel 'SNR (dB)'
 set xrange [-0.5:22.5]
@@ -39,7 +39,7 @@ plot dir.'/summary.csv' using 2:(host(0) ? $4 : 1/0) with linespoints pt 7 lc 'd
      dir.'/summary.csv' using 2:(host(0) ? $6 : 1/0) with linespoints pt 5 lc 'dark-cyan' title "host, speech-like", \
      dir.'/summary.csv' using 2:(builtin(0) ? $4 : 1/0) with linespoints pt 7 lc 'dark-red' title "builtin, white noise", \
      dir.'/summary.csv' using 2:(builtin(0) ? $6 : 1/0) with linespoints pt 5 lc 'orange' title "builtin, speech-like", \
-     -10 dt 2 lc 'black' notitle
+     -18 dt 2 lc 'black' notitle
 
 # Latency from the tone's start, 300 ms tones in white noise.
 set output dir.'/latency.png'
@@ -52,7 +52,7 @@ plot dir.'/codes-white-300ms.csv' using 2:(host(0) && $6 > 0 ? $6 : 1/0) with li
      dir.'/codes-white-300ms.csv' using 2:(host(0) && $7 > 0 ? $7 : 1/0) with linespoints pt 5 lc 'dark-cyan' title 'host, 99th percentile', \
      dir.'/codes-white-300ms.csv' using 2:(builtin(0) && $6 > 0 ? $6 : 1/0) with linespoints pt 7 lc 'dark-red' title 'builtin, median', \
      dir.'/codes-white-300ms.csv' using 2:(builtin(0) && $7 > 0 ? $7 : 1/0) with linespoints pt 5 lc 'orange' title 'builtin, 99th percentile', \
-     60 dt 2 lc 'black' title 'targets at 10 dB: 60 / 120 ms', 120 dt 2 lc 'black' notitle
+     18 dt 2 lc 'black' title 'targets at 10 dB: 18 / 30 ms', 30 dt 2 lc 'black' notitle
 
 # Tone length at 10 dB SNR.
 set output dir.'/tone-length.png'
