@@ -38,6 +38,10 @@ TEST(HostCli, HelpVersionAndBadUsage) {
         {{"frobnicate"}, "unknown command 'frobnicate'"},
         {{"listen", "--mic", "bogus"}, "--mic: unknown audio route 'bogus'"},
         {{"handshake", "--role", "speaker", "--first-code", "17"}, "--first-code"},  // its answer 18 is masked
+        {{"handshake", "--role", "speaker", "--codes", "3..4"}, "--codes: '3..4' is not at least three codes within 0..17"},
+        {{"demo", "--codes", "2-9"}, "--codes: '2-9' is not a range of codes LO..HI"},
+        {{"handshake", "--role", "speaker", "--codes", "4..9", "--first-code", "2"}, "--first-code: must be 4..8"},
+        {{"demo", "--pairs", "6", "--devices", "cheap-speaker"}, "--pairs 6: 11 codes are too few for 6 pairs of at least three"},
         {{"listen", "--seconds", "nan"}, "--seconds: 'nan' is not a number"},
         {{"listen", "--seconds", "inf"}, "--seconds: 'inf' is not a number"},
         {{"sweep", "--seconds", "-nan"}, "--seconds"},

@@ -91,6 +91,27 @@ TEST(HostDemo, InAnOfficeAndAKitchenWithTheCodesTheLoudspeakersCarry) {
     EXPECT_EQ(r.err, "soundmeter: --room applies to simulated rooms only, not to null\n");
 }
 
+TEST(HostDemo, TwoPairsInOneRoomEachOnItsShareOfTheCodes) {
+    const ProcessResult r = runHost(kHost, {"demo", "--pairs", "2", "--rounds", "4"}, kRunMs);
+    EXPECT_EQ(r.status, 0) << r.out << r.err;
+    EXPECT_NE(r.out.find(": codes 0..8, 9..17\n"), std::string::npos) << r.out;
+    for (const char* pair : {"pair 1  4 of 4 exchanges completed", "pair 2  4 of 4 exchanges completed"}) {
+        EXPECT_NE(r.out.find(pair), std::string::npos) << r.out;
+    }
+    // Every code said is in its pair's share.
+    int said = 0;
+    const std::regex saying(R"(pair ([12]) .* says  code +(\d+) )");
+    for (const std::string& line : linesOf(r.out)) {
+        std::smatch m;
+        if (!std::regex_search(line, m, saying)) continue;
+        ++said;
+        EXPECT_EQ(std::stoi(m[2]) <= 8, m[1] == "1") << line;
+    }
+    EXPECT_GE(said, 16);
+    const std::string last = "2 pairs: 2 completed every exchange; devices heard 0 codes before their own peer said them\n";
+    EXPECT_EQ(r.out.substr(r.out.size() - std::min(r.out.size(), last.size())), last) << r.out;
+}
+
 TEST(HostDemo, ADeviceThatStopsRespondingEndsTheDemo) {
     HostProcess demo(kHost);
     ASSERT_TRUE(demo.start({"demo", "--rounds", "20", "--timeout-ms", "1000", "--tone-ms", "300"}));

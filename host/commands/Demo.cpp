@@ -16,6 +16,7 @@
 #include "host/base/Clock.h"
 #include "host/base/Interrupt.h"
 #include "host/commands/demo/DemoDevices.h"
+#include "host/commands/demo/DemoPairs.h"
 #include "host/commands/demo/DemoRounds.h"
 #include "host/core/Environment.h"
 #include "host/core/Options.h"
@@ -39,6 +40,11 @@ struct DemoOptions {
     DecoderKind decoder = DecoderKind::Host;
     std::string room;     // a room preset of the simulated room; empty: the environment's
     std::string devices;  // a device preset for both devices; empty: the environment's
+    CodeRange codes;
+    bool codesGiven = false;
+    int pairs = 1;
+    bool sameCodes = false;   // every pair on the same codes (to measure why they are not)
+    bool sharedRoom = false;  // a pair of several in one room: other pairs' speakers are welcome
 };
 
 // In noise the room carries the speakers to the microphones 20 dB down, so that the
@@ -57,12 +63,15 @@ std::string uniqueRoomName() {
 
 class DemoRun {
 public:
-    DemoRun(const CommonOptions& common, const DemoOptions& o) : mCommon(common), mOpt(o), mRounds(o.rounds, o.noAck) {}
+    DemoRun(const CommonOptions& common, const DemoOptions& o) : mCommon(common), mOpt(o), mRounds(o.rounds, o.noAck) {
+        if (o.sharedRoom) mRounds.shareRoom();
+    }
 
     int run() {
         applyLogSettings(mCommon.verbose);  // the demo itself only visits the room at the end
         if (!levelApplies("demo", mOpt.level, mOpt.decoder)) return 2;
         mRoom = uniqueRoomName();
+        if (mOpt.pairs > 1) return runAllPairs();
         // --mic / --speaker put both devices on the given routes (a named room that a monitor
         // can join, for instance); a route not given is the fresh room's.
         mMic = mCommon.mic.empty() ? "sim:" + mRoom : mCommon.mic;
@@ -85,9 +94,12 @@ public:
         std::string presets;
         if (!mOpt.room.empty()) presets += ", room " + mOpt.room;
         if (!mOpt.devices.empty()) presets += ", devices " + mOpt.devices;
-        mCodes = carriedCodes();
-        if (mCodes < kBuiltinCodes) {
-            presets += ", codes 0.." + std::to_string(mCodes - 1) + " (the " + mOpt.devices + "'s loudspeaker carries none above " +
+        if (mOpt.codesGiven) {
+            mCodes = mOpt.codes;
+            presets += ", codes " + mCodes.text();
+        } else if (carriedCodes() < kBuiltinCodes) {
+            mCodes.hi = carriedCodes() - 1;
+            presets += ", codes " + mCodes.text() + " (the " + mOpt.devices + "'s loudspeaker carries none above " +
                        std::to_string(int(korvo::platform::devicePresetTopHz(mOpt.devices))) + " Hz)";
         }
         infof("demo %s: %s, acknowledgement %s, tones of %d ms, %s, %s decision%s%s\n", shown(where).c_str(),
@@ -105,6 +117,52 @@ public:
     }
 
 private:
+    // Several pairs in one fresh room, each a demo of its own on its share of the codes the
+    // loudspeakers carry (or all of them on the same codes, with --same-codes).
+    int runAllPairs() {
+        if (!mCommon.mic.empty() || !mCommon.speaker.empty()) {
+            errf("--pairs puts the pairs in a fresh room of their own: --mic and --speaker do not apply");
+            return 2;
+        }
+        const CodeRange all = mOpt.codesGiven ? mOpt.codes : CodeRange{0, carriedCodes() - 1};
+        const int share = all.count() / mOpt.pairs;
+        if (!mOpt.sameCodes && share < 3) {
+            errf("--pairs %d: %s are too few for %d pairs of at least three", mOpt.pairs,
+                 plural(all.count(), "code").c_str(), mOpt.pairs);
+            return 2;
+        }
+        PairsPlan plan;
+        plan.room = mRoom;
+        std::string shares;
+        for (int i = 0; i < mOpt.pairs; ++i) {
+            const CodeRange codes = mOpt.sameCodes ? all : CodeRange{all.lo + i * share, all.lo + (i + 1) * share - 1};
+            shares += (i ? ", " : "") + codes.text();
+            plan.demos.push_back(pairArguments(codes));
+        }
+        infof("demo of %d pairs in room %s: codes %s%s\n", mOpt.pairs, mRoom.c_str(), shares.c_str(),
+              mOpt.sameCodes ? " (the same for every pair)" : "");
+        return runPairs(plan);
+    }
+
+    // One pair's demo: this demo's options on the shared room and the pair's codes.
+    std::vector<std::string> pairArguments(const CodeRange& codes) const {
+        std::vector<std::string> args = {"soundmeter"};
+        if (mCommon.json) args.push_back("--json");
+        if (mCommon.quiet) args.push_back("-q");
+        for (int i = 0; i < mCommon.verbose; ++i) args.push_back("-v");
+        if (!mCommon.plugin.empty()) args.push_back("--plugin=" + mCommon.plugin);
+        args.insert(args.end(), {"demo", "--rounds", std::to_string(mOpt.rounds), "--tone-ms", std::to_string(mOpt.toneMs),
+                                 "--timeout-ms", std::to_string(mOpt.timeoutMs), "--mic", "sim:" + mRoom, "--speaker",
+                                 "sim:" + mRoom, "--codes=" + codes.text(), "--shared-room",
+                                 std::string("--decoder=") + decoderName(mOpt.decoder)});
+        if (mOpt.noAck) args.push_back("--no-ack");
+        if (mOpt.snrGiven) args.push_back("--snr=" + std::to_string(mOpt.snr));
+        if (mOpt.level.given) args.push_back(mOpt.level.automatic ? "--level=auto" : "--level=" + std::to_string(mOpt.level.value));
+        if (!mOpt.room.empty()) args.push_back("--room=" + mOpt.room);
+        if (!mOpt.devices.empty()) args.push_back("--devices=" + mOpt.devices);
+        return args;
+    }
+
     // A room's or a device's preset is the simulated room's: a sound card has its own.
     bool presetsApply() const {
         if (mOpt.room.empty() && mOpt.devices.empty()) return true;
@@ -130,6 +188,7 @@ private:
     // Speakers of another run in a room would mix their codes with this demo's, and both
     // runs would fail rounds without knowing why. A monitor only listens: it is welcome.
     bool roomsFree() {
+        if (mOpt.sharedRoom) return true;
         return roomFree(mSpeaker, "speaker") && (mMic == mSpeaker || roomFree(mMic, "microphone"));
     }
 
@@ -155,7 +214,7 @@ private:
                                          std::to_string(mOpt.toneMs), "--timeout-ms", std::to_string(mOpt.timeoutMs),
                                          "--mic", mMic, "--speaker", mSpeaker};
         if (mOpt.noAck) args.push_back("--no-ack");
-        if (mCodes < kBuiltinCodes) args.push_back("--codes=" + std::to_string(mCodes));
+        if (mCodes.count() < kBuiltinCodes) args.push_back("--codes=" + mCodes.text());
         if (!mOpt.room.empty()) env.emplace_back("KORVO_SIM_ROOM", mOpt.room);
         if (!mOpt.devices.empty()) {
             env.emplace_back("KORVO_SIM_DEVICE", mOpt.devices);
@@ -273,7 +332,7 @@ private:
     DemoRounds mRounds;
     bool mReady[2] = {false, false};
     bool mCrowded = false;  // another run's speakers came into the room
-    int mCodes = kBuiltinCodes;  // the handshake's codes the loudspeakers carry
+    CodeRange mCodes;  // the handshake's codes this exchange uses
 };
 
 }  // namespace
@@ -316,6 +375,18 @@ Command addDemoCommand(CLI::App& app, CommonOptions& common) {
                     "both devices' loudspeakers, microphones and clocks (README: Simulated rooms; default: "
                     "KORVO_SIM_DEVICE, else ideal)")
         ->check(CLI::IsMember(korvo::platform::devicePresets()));
+    addCodesOption(sub, &options->codes,
+                   "the codes the exchange uses (default: those the devices' loudspeakers carry; with --pairs, shared "
+                   "out among the pairs)")
+        ->each([options](const std::string&) { options->codesGiven = true; });
+    sub->add_option("--pairs", options->pairs,
+                    "pairs of devices in one fresh room, each on its own share of the codes; the summary counts the "
+                    "codes a device heard before its own peer said them")
+        ->check(CLI::Range(1, 6))
+        ->capture_default_str();
+    sub->add_flag("--same-codes", options->sameCodes, "with --pairs: every pair on all the codes, to see why they are shared out");
+    // A pair's own demo, run by --pairs: not in the help.
+    sub->add_flag("--shared-room", options->sharedRoom, "other pairs' speakers are in the room")->group("");
     // Both devices use these routes instead of the fresh room (e.g. sim:lab, which a monitor can join).
     addRouteOptions(sub, common, "the fresh room", "the fresh room");
     return {sub, [&common, options] {

@@ -43,19 +43,20 @@ struct HandshakeOptions {
     bool noAck = false;
     int toneMs = 64;  // heard to -11 dB SNR; a longer tone only delays the answer it overlaps
     int timeoutMs = 10000;
-    int firstCode = 0;
-    int codes = kHandshakeCodes;  // codes 0..codes-1 are used
+    int firstCode = -1;  // -1: the lowest of the codes
+    CodeRange codes;
     LevelChoice level;
     DecoderKind decoder = DecoderKind::Host;
     bool startOnStdin = false;
 };
 
 // Code the speaker says in round r (from 0). With acknowledgement the answer k + 1
-// must be a handshake code too, so the speaker keeps to 0..codes-2 and steps by two (with
-// 18 codes: 0, 2, .., 16, 1, 3, .., 15, 0, ..): every code is used, each answer included.
+// must be a handshake code too, so the speaker keeps to LO..HI-1 and steps by two (with
+// 0..17: 0, 2, .., 16, 1, 3, .., 15, 0, ..): every code is used, each answer included.
 int speakerCode(const HandshakeOptions& o, int round) {
-    if (o.noAck) return (o.firstCode + round) % o.codes;
-    return (o.firstCode + 2 * round) % (o.codes - 1);
+    const int first = (o.firstCode < 0 ? o.codes.lo : o.firstCode) - o.codes.lo;
+    if (o.noAck) return o.codes.lo + (first + round) % o.codes.count();
+    return o.codes.lo + (first + 2 * round) % (o.codes.count() - 1);
 }
 
 // After "ready", waits for a line on stdin before the first round, hearing meanwhile so the
@@ -197,9 +198,9 @@ int runHandshake(const CommonOptions& common, const HandshakeOptions& o) {
     // A device of the demo: the demo stops it with SIGTERM and says why itself.
     if (o.startOnStdin) leaveInterruptionsToParent();
     const bool speaker = o.role == "speaker";
-    const int limit = o.noAck ? o.codes - 1 : o.codes - 2;
-    if (o.firstCode > limit) {
-        errf("--first-code: must be 0..%d %s", limit,
+    const int limit = o.noAck ? o.codes.hi : o.codes.hi - 1;
+    if (o.firstCode >= 0 && (o.firstCode < o.codes.lo || o.firstCode > limit)) {
+        errf("--first-code: must be %d..%d %s", o.codes.lo, limit,
              o.noAck ? "without acknowledgement" : "with acknowledgement, whose answer is code + 1");
         return 2;
     }
@@ -268,15 +269,12 @@ Command addHandshakeCommand(CLI::App& app, CommonOptions& common) {
         ->check(CLI::Range(100, 3600000))
         ->capture_default_str();
     sub->add_option("--first-code", options->firstCode,
-                    "code of the first round; codes cycle through 0..17 (0..16 said, answers k + 1, with "
-                    "acknowledgement)")
-        ->check(CLI::Range(0, kHandshakeCodes - 1))
-        ->capture_default_str();
-    sub->add_option("--codes", options->codes,
-                    "use codes 0..N-1 only, for a loudspeaker that cannot play the higher ones (both devices must "
-                    "agree)")
-        ->check(CLI::Range(3, kHandshakeCodes))
-        ->capture_default_str();
+                    "code of the first round (default: the lowest of --codes); codes cycle through 0..17 (0..16 said, "
+                    "answers k + 1, with acknowledgement)")
+        ->check(CLI::Range(0, kHandshakeCodes - 1));
+    addCodesOption(sub, &options->codes,
+                   "use codes LO..HI only: the ones a loudspeaker carries, or one pair's share of a room (both devices "
+                   "must agree)");
     addLevelOption(sub, &options->level,
                    "detection level for --decoder builtin: spectrum levels at or below it count as silence (raise it in noise)");
     addDecoderOption(sub, &options->decoder);

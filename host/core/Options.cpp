@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdlib>
+#include <cstdio>
 #include <map>
 
 #include <CLI/CLI.hpp>
@@ -94,6 +95,33 @@ void addLevelOption(CLI::App* sub, LevelChoice* level, const char* help, bool al
                 return {};
             },
             "", "level"));
+}
+
+CLI::Option* addCodesOption(CLI::App* sub, CodeRange* codes, const char* help) {
+    return sub->add_option_function<std::string>(
+           "--codes",
+           [codes](const std::string& v) {
+               const size_t dots = v.find("..");
+               codes->lo = std::stoi(v.substr(0, dots));
+               codes->hi = std::stoi(v.substr(dots + 2));
+           },
+           help)
+        ->type_name("LO..HI")
+        ->default_str(CodeRange{}.text())
+        ->check(CLI::Validator(
+            [](std::string& v) -> std::string {
+                const size_t dots = v.find("..");
+                int lo = -1, hi = -1;
+                char rest = 0;
+                const bool form = dots != std::string::npos && std::sscanf(v.c_str(), "%d..%d%c", &lo, &hi, &rest) == 2 &&
+                                  v.find_first_not_of("0123456789.") == std::string::npos;
+                if (!form) return "'" + v + "' is not a range of codes LO..HI";
+                if (lo < 0 || hi >= kBuiltinCodes || hi - lo + 1 < 3) {
+                    return "'" + v + "' is not at least three codes within 0.." + std::to_string(kBuiltinCodes - 1);
+                }
+                return {};
+            },
+            "", "codes"));
 }
 
 void addDecoderOption(CLI::App* sub, DecoderKind* decoder) {

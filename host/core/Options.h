@@ -8,6 +8,7 @@
 
 namespace CLI {
 class App;
+class Option;
 class Validator;
 }  // namespace CLI
 
@@ -39,6 +40,16 @@ struct LevelChoice {
     bool automatic = false;
     int value = 0;
 };
+
+// Codes LO..HI of the handshake's 0..17, at least three of them (a code, its answer, the next).
+struct CodeRange {
+    int lo = 0;
+    int hi = kBuiltinCodes - 1;
+    int count() const { return hi - lo + 1; }
+    std::string text() const { return std::to_string(lo) + ".." + std::to_string(hi); }
+};
+// --codes LO..HI.
+CLI::Option* addCodesOption(CLI::App* sub, CodeRange* codes, const char* help);
 
 // Every whole-number option of every command reads its text as decimal; call once
 // the commands are added.

@@ -29,6 +29,7 @@ void DemoRounds::add(Who who, const ProtocolLine& p) {
     } else if (p.event == "heard") {
         const long long toneAt = who == kListener ? r.saidAt : r.answeredAt;
         const long long oneWay = toneAt >= 0 ? t - toneAt : p.get("waited");
+        if (toneAt < 0) ++mForeign;  // its peer has not said it in this round
         (who == kListener ? r.heard : r.answerHeard) = code;
         event(JsonEvent("heard").add("device", kWhoName[who]).add("round", round).add("code", code).add("one_way_ms", oneWay),
               t, who, "hears code %2d (%5d Hz), one way %lld ms", code, codeHz(code), oneWay);
@@ -77,8 +78,13 @@ void DemoRounds::summarize() const {
     const int done = completed();
     JsonEvent summary("summary");
     summary.add("rounds", mRounds).add("completed", done);
+    std::string shared;
+    if (mShared) {
+        summary.add("foreign", mForeign);
+        shared = "; " + plural(mForeign, "code") + " heard before this pair said " + (mForeign == 1 ? "it" : "them");
+    }
     if (done == 0) {
-        resultf(summary, "0 of %s completed\n", plural(mRounds, "exchange").c_str());
+        resultf(summary, "0 of %s completed%s\n", plural(mRounds, "exchange").c_str(), shared.c_str());
         return;
     }
     std::vector<long long> sorted = mLatencies;
@@ -86,8 +92,8 @@ void DemoRounds::summarize() const {
     const size_t mid = sorted.size() / 2;
     const double median = sorted.size() % 2 ? double(sorted[mid]) : (sorted[mid - 1] + sorted[mid]) / 2.0;
     summary.add("median_ms", median).add("worst_ms", sorted.back());
-    resultf(summary, "%d of %s completed, %s median %.0f ms, worst %lld ms\n", done, plural(mRounds, "exchange").c_str(),
-            mNoAck ? "one way" : "round trip", median, sorted.back());
+    resultf(summary, "%d of %s completed, %s median %.0f ms, worst %lld ms%s\n", done, plural(mRounds, "exchange").c_str(),
+            mNoAck ? "one way" : "round trip", median, sorted.back(), shared.c_str());
 }
 
 }  // namespace host

@@ -20,6 +20,9 @@ extern const char* const kWhoName[2];
 class DemoRounds {
 public:
     DemoRounds(int rounds, bool noAck) : mRounds(rounds), mNoAck(noAck) {}
+    // In a room shared with other pairs: the summary also counts the codes a device heard
+    // before its peer said them in that round (another pair's, taken for its own).
+    void shareRoom() { mShared = true; }
 
     // Times are shown from `startMs` on.
     void start(int64_t startMs) { mStart = startMs; }
@@ -30,6 +33,7 @@ public:
     int completed() const { return static_cast<int>(mLatencies.size()); }
     // The summary line: exchanges completed, median and worst time.
     void summarize() const;
+    int foreign() const { return mForeign; }
 
 private:
     // What happened in one round, from both devices' lines.
@@ -44,6 +48,8 @@ private:
 
     int mRounds;
     bool mNoAck;
+    bool mShared = false;
+    int mForeign = 0;
     int64_t mStart = 0;
     std::map<int, Round> mRound;
     std::map<int, bool> mCounted;
