@@ -202,7 +202,7 @@ bool FrameDecoder::begins(int code, Track& t) {
         t.misses = 0;
         t.endLevel = 0.0;
         t.peakLevel = p.power;
-        t.fell = false;
+        t.fallen = 0;
         return true;
     }
     return false;
@@ -220,13 +220,18 @@ bool FrameDecoder::holdOrEnd(int code, Track& t) {
     if (held) {
         t.misses = 0;
         t.endLevel = 0.0;
-        if (level < kFallFactor * t.peakLevel) t.fell = true;
-        if (t.fell && level >= kRiseFactor * t.peakLevel) {
-            t.fell = false;
+        const bool fell = t.fallen >= kFallFrames;
+        if (fell && level >= kRiseFactor * t.peakLevel) {
+            t.fallen = 0;
             t.peakLevel = level;
             return true;
         }
-        if (!t.fell) t.peakLevel = std::max(t.peakLevel, level);
+        if (level < kFallFactor * t.peakLevel) {
+            ++t.fallen;
+        } else if (!fell) {
+            t.fallen = 0;
+            t.peakLevel = std::max(t.peakLevel, level);
+        }
         return false;
     }
     t.endLevel = std::max(t.endLevel, level);
