@@ -51,7 +51,8 @@ Convolver::Convolver(const std::vector<float>& response)
     : mFft(std::make_unique<Fft>()),
       mPartitions(std::max(1, static_cast<int>((response.size() + kBlock - 1) / kBlock))),
       mInput(kSize, 0.0f),
-      mOutput(kBlock, 0.0f) {
+      mOutput(kBlock, 0.0f),
+      mSilent(static_cast<size_t>(mPartitions), 1) {
     Fft& f = *mFft;
     f.responses.assign(static_cast<size_t>(mPartitions) * kBins, {});
     f.inputs.assign(static_cast<size_t>(mPartitions) * kBins, {});
@@ -83,15 +84,25 @@ void Convolver::process(const float* in, float* out, int count) {
 
 void Convolver::runBlock() {
     Fft& f = *mFft;
+    mNewest = (mNewest + 1) % mPartitions;
+    const bool silent = std::all_of(mInput.begin(), mInput.end(), [](float v) { return v == 0.0f; });
+    mSilent[static_cast<size_t>(mNewest)] = silent;
     // Overlap-save: transform the last two blocks; the second half of the circular
     // convolution is the linear one for the newest block.
-    std::copy(mInput.begin(), mInput.end(), f.time);
-    fftwf_execute(f.forward);
-    mNewest = (mNewest + 1) % mPartitions;
-    std::copy(f.bins(), f.bins() + kBins, f.inputs.begin() + static_cast<long>(mNewest) * kBins);
+    if (!silent) {
+        std::copy(mInput.begin(), mInput.end(), f.time);
+        fftwf_execute(f.forward);
+        std::copy(f.bins(), f.bins() + kBins, f.inputs.begin() + static_cast<long>(mNewest) * kBins);
+    }
+    std::copy(mInput.begin() + kBlock, mInput.end(), mInput.begin());
+    if (std::all_of(mSilent.begin(), mSilent.end(), [](char s) { return s != 0; })) {
+        std::fill(mOutput.begin(), mOutput.end(), 0.0f);
+        return;
+    }
     std::fill(f.sum.begin(), f.sum.end(), std::complex<float>{});
     for (int p = 0; p < mPartitions; ++p) {
         const int slot = (mNewest - p + mPartitions) % mPartitions;
+        if (mSilent[static_cast<size_t>(slot)]) continue;  // a zero spectrum adds nothing
         const std::complex<float>* x = &f.inputs[static_cast<size_t>(slot) * kBins];
         const std::complex<float>* h = &f.responses[static_cast<size_t>(p) * kBins];
         // Written out: std::complex's operator* checks for infinities on every product.
@@ -104,7 +115,6 @@ void Convolver::runBlock() {
     std::copy(f.sum.begin(), f.sum.end(), f.bins());
     fftwf_execute(f.inverse);
     std::copy(f.time + kBlock, f.time + kSize, mOutput.begin());
-    std::copy(mInput.begin() + kBlock, mInput.end(), mInput.begin());
 }
 
 }  // namespace acoustics
