@@ -10,6 +10,7 @@
 #include <cmath>
 #include <cstdio>
 #include <tuple>
+#include <numeric>
 #include <random>
 #include <string>
 #include <vector>
@@ -107,12 +108,13 @@ TEST(Acoustics, ResponsesHaveTheirPresetsCornersAndResonances) {
 
 TEST(Acoustics, DistortionHasThePresetsHarmonicsAtFullScaleAndFallsWithLevel) {
     for (const DevicePreset& d : devicePresets()) {
-        const Distortion distortion(d.secondDb, d.thirdDb);
+        Distortion distortion(d.secondDb, d.thirdDb);
         EXPECT_EQ(distortion.none(), d.secondDb <= -200.0) << d.name;
         std::array<double, 2> fullScale{};
         for (const double level : {1.0, 0.5}) {
-            std::vector<float> x = sine(1000.0, level, 4410);  // 100 whole cycles
+            std::vector<float> x = sine(1000.0, level, 2 * 4410);
             distortion.process(x.data(), static_cast<int>(x.size()));
+            x.erase(x.begin(), x.begin() + 4410);  // the last 100 whole cycles, past the filters' start
             const double h1 = amplitudeAt(x, 1000.0), h2 = amplitudeAt(x, 2000.0), h3 = amplitudeAt(x, 3000.0);
             if (distortion.none()) {
                 EXPECT_LT(h2 + h3, 1e-6) << d.name;
@@ -130,6 +132,27 @@ TEST(Acoustics, DistortionHasThePresetsHarmonicsAtFullScaleAndFallsWithLevel) {
             }
         }
     }
+}
+
+TEST(Acoustics, DistortionKeepsItsHarmonicsAboveHalfTheRateOutOfTheBand) {
+    const DevicePreset& cheap = *findDevicePreset("cheap-speaker");
+    Distortion distortion(cheap.secondDb, cheap.thirdDb);
+    // 16.3 kHz at full scale: its harmonics at 32.7 and 49 kHz would fold to 11.4 and 4.9
+    // kHz, beside codes 10 and 3. Over 200 whole cycles, the fundamental arrives kDelay late.
+    const double hz = 16317.0;
+    std::vector<float> x = sine(hz, 1.0, 2 * 44100);
+    distortion.process(x.data(), static_cast<int>(x.size()));
+    const std::vector<float> clean = sine(hz, 1.0, 2 * 44100);
+    x.erase(x.begin(), x.begin() + 44100);
+    const double h1 = amplitudeAt(x, hz);
+    // In the pass band the fundamental is whole: 1 + 3 a3 / 4 (the cube's share).
+    const double r3 = std::pow(10.0, cheap.thirdDb / 20.0);
+    EXPECT_NEAR(h1, 1.0 + 3.0 * r3 / (1.0 - 3.0 * r3), 0.01);
+    for (const double folded : {44100.0 - 2 * hz, 3 * hz - 44100.0}) EXPECT_LT(db(amplitudeAt(x, folded) / h1), -90.0) << folded;
+    // And it is the input, kDelay later, over the square's constant (which the loudspeaker's
+    // high-pass takes away).
+    const double dc = std::accumulate(x.begin(), x.end(), 0.0) / static_cast<double>(x.size());
+    for (size_t i : {1000u, 1001u, 1002u}) EXPECT_NEAR(x[i] - dc, h1 * clean[44100 + i - Distortion::kDelay], 0.01) << i;
 }
 
 TEST(Acoustics, AClockOffsetIsReadBackFromATonesFrequency) {

@@ -5,7 +5,9 @@
 // (scripts/envelope.sh; about 40 minutes on two cores): it writes CSV files and
 // gnuplot's PNG plots into the output folder.
 //
-//   korvo_envelope [--out DIR] [--trials N] [--quick] [--no-realtime | --realtime-only] [--soundmeter PATH]
+//   korvo_envelope [--out DIR] [--trials N] [--quick] [--no-realtime | --realtime-only | --rooms] [--soundmeter PATH]
+//
+// --rooms measures the simulated room's presets instead (Rooms.h; 100 trials a code by default).
 #include <unistd.h>
 
 #include <algorithm>
@@ -20,7 +22,9 @@
 #include <thread>
 #include <vector>
 
+#include "envelope/Jobs.h"
 #include "envelope/RealTime.h"
+#include "envelope/Rooms.h"
 #include "envelope/Trials.h"
 
 using namespace korvo::envelope;
@@ -30,10 +34,11 @@ namespace {
 
 struct Settings {
     std::string out = "docs/envelope";
-    int trials = 300;
+    int trials = 0;  // 300 a point; 100 a code and preset for --rooms
     bool quick = false;
     bool realtime = true;
     bool realtimeOnly = false;  // only the real-time check (its CSV), not the grids
+    bool rooms = false;         // only the room and device presets
     std::string soundmeter;
     unsigned threads = std::max(1u, std::thread::hardware_concurrency());
 };
@@ -50,24 +55,6 @@ const DecoderKind kDecoders[] = {DecoderKind::Host, DecoderKind::Builtin};
 constexpr double kLengthSnr = 10.0;   // tone lengths are measured at this SNR
 constexpr double kLatencySnr = 10.0;  // and latency
 constexpr double kFalseMinutes = 10.0;
-
-// Runs jobs on all cores; each job writes only its own result.
-void runAll(std::vector<std::function<void()>>& jobs, unsigned threads) {
-    std::atomic<size_t> next{0};
-    std::atomic<size_t> done{0};
-    std::vector<std::thread> pool;
-    for (unsigned t = 0; t < threads; ++t) {
-        pool.emplace_back([&] {
-            for (size_t i; (i = next++) < jobs.size();) {
-                jobs[i]();
-                const size_t d = ++done;
-                if (d % 50 == 0 || d == jobs.size()) fprintf(stderr, "\r  %zu of %zu", d, jobs.size());
-            }
-        });
-    }
-    for (std::thread& t : pool) t.join();
-    fprintf(stderr, "\n");
-}
 
 std::vector<PointResult> runPoints(const std::vector<Point>& points, const Settings& s) {
     std::vector<PointResult> results(points.size());
@@ -147,19 +134,8 @@ std::vector<FalseResult> measureFalse(const Settings& s) {
     return results;
 }
 
-FILE* openCsv(const Settings& s, const char* name, const char* header) {
-    const std::string path = s.out + "/" + name;
-    FILE* f = fopen(path.c_str(), "w");
-    if (!f) {
-        fprintf(stderr, "korvo_envelope: cannot write %s: %s\n", path.c_str(), strerror(errno));
-        exit(1);
-    }
-    fprintf(f, "%s\n", header);
-    return f;
-}
-
 void writePoints(const Settings& s, const char* name, const std::vector<PointResult>& results) {
-    FILE* f = openCsv(s, name,
+    FILE* f = openCsv(s.out, name,
                       "decoder,noise,tone_ms,code,hz,snr_db,trials,heard,p_heard,lower95,latency_median_ms,latency_p99_ms,"
                       "level,false_codes,p_analysed");
     for (const PointResult& r : results) {
@@ -175,7 +151,7 @@ void writePoints(const Settings& s, const char* name, const std::vector<PointRes
 // probability heard, the mean share of trials with an analysed frame holding the tone,
 // the median of the codes' median latencies and the worst 99th percentile.
 void writeAggregate(const Settings& s, const char* name, const std::vector<PointResult>& results, bool byLength) {
-    FILE* f = openCsv(s, name, byLength ? "decoder,tone_ms,min_p,mean_p,p_analysed,latency_median_ms,latency_p99_max_ms"
+    FILE* f = openCsv(s.out, name, byLength ? "decoder,tone_ms,min_p,mean_p,p_analysed,latency_median_ms,latency_p99_max_ms"
                                         : "decoder,snr_db,min_p,mean_p,p_analysed,latency_median_ms,latency_p99_max_ms");
     for (DecoderKind d : kDecoders) {
         std::map<double, std::vector<const PointResult*>> byX;
@@ -268,14 +244,17 @@ int main(int argc, char** argv) {
             s.realtime = false;
         } else if (a == "--realtime-only") {
             s.realtimeOnly = true;
+        } else if (a == "--rooms") {
+            s.rooms = true;
         } else if (a == "--soundmeter" && i + 1 < argc) {
             s.soundmeter = argv[++i];
         } else {
-            fprintf(stderr, "usage: korvo_envelope [--out DIR] [--trials N] [--quick] [--no-realtime | --realtime-only] [--soundmeter PATH]\n");
+            fprintf(stderr, "usage: korvo_envelope [--out DIR] [--trials N] [--quick] [--no-realtime | --realtime-only | --rooms] [--soundmeter PATH]\n");
             return 2;
         }
     }
     if (s.soundmeter.empty()) s.soundmeter = selfFolder() + "/soundmeter";
+    if (s.trials == 0) s.trials = s.rooms ? 100 : 300;
     if (s.quick) s.trials = std::min(s.trials, 60);
     if (access(s.out.c_str(), W_OK) != 0) {
         fprintf(stderr, "korvo_envelope: output folder %s: %s\n", s.out.c_str(), strerror(errno));
@@ -284,10 +263,19 @@ int main(int argc, char** argv) {
 
     const std::vector<double> snrs = s.quick ? std::vector<double>{10, 0, -10} : kSnrs;
     const std::vector<double> speechSnrs = s.quick ? std::vector<double>{10, -10, -30} : kSpeechSnrs;
-    if (!s.realtimeOnly) measureGrids(s, snrs, speechSnrs);
-    if (s.realtime) checkRealTimes(s);
+    if (s.rooms) {
+        RoomSettings r;
+        r.out = s.out;
+        r.trials = s.trials;
+        r.quietMinutes = s.quick ? 1.0 : 10.0;
+        r.threads = s.threads;
+        measureRooms(r);
+    } else {
+        if (!s.realtimeOnly) measureGrids(s, snrs, speechSnrs);
+        if (s.realtime) checkRealTimes(s);
+    }
 
-    const std::string plot = "gnuplot -e \"dir='" + s.out + "'\" '" + KORVO_ENVELOPE_PLOTS + "'";
+    const std::string plot = "gnuplot -e \"dir='" + s.out + "'\" '" + (s.rooms ? KORVO_ROOM_PLOTS : KORVO_ENVELOPE_PLOTS) + "'";
     if (system(plot.c_str()) != 0) fprintf(stderr, "korvo_envelope: gnuplot failed (scripts/install-deps.sh envelope installs it)\n");
     fprintf(stderr, "wrote %s\n", s.out.c_str());
     return 0;
@@ -310,7 +298,7 @@ void measureGrids(const Settings& s, const std::vector<double>& snrs, const std:
     writeAggregate(s, "codes-tone-length.csv", lengths, true);
     const auto falses = measureFalse(s);
     {
-        FILE* f = openCsv(s, "false-codes.csv", "decoder,noise,noise_dbfs,minutes,level,steps,false_codes,per_10k");
+        FILE* f = openCsv(s.out, "false-codes.csv", "decoder,noise,noise_dbfs,minutes,level,steps,false_codes,per_10k");
         for (const FalseResult& r : falses) {
             fprintf(f, "%s,%s,%.0f,%.1f,%d,%lld,%d,%.4f\n", korvo::host::decoderName(r.decoder), noiseName(r.noise), r.noiseDbfs,
                     r.minutes, r.level, static_cast<long long>(r.steps), r.falseCodes, r.per10k());
@@ -319,7 +307,7 @@ void measureGrids(const Settings& s, const std::vector<double>& snrs, const std:
     }
 
     // Per code, the headline figures.
-    FILE* f = openCsv(s, "summary.csv",
+    FILE* f = openCsv(s.out, "summary.csv",
                       "decoder,code,hz,snr99_white_300ms,snr99_white_40ms,snr99_speech_300ms,best_p_white_40ms,"
                       "latency_median_ms_10db,latency_p99_ms_10db,shortest_tone_99_ms_10db");
     for (DecoderKind d : kDecoders) {
@@ -340,7 +328,7 @@ void checkRealTimes(const Settings& s) {
     checks[1].code = 17, checks[1].toneMs = 40, checks[1].snrDb = 0, checks[1].seed = 502;
     checks[2].code = 10, checks[2].toneMs = 300, checks[2].snrDb = 10, checks[2].seed = 503;
     checks[2].decoder = DecoderKind::Builtin;
-    FILE* r = openCsv(s, "realtime-check.csv",
+    FILE* r = openCsv(s.out, "realtime-check.csv",
                       "decoder,noise,tone_ms,code,snr_db,tones,heard_live,heard_simulated,latency_median_live_ms,"
                       "latency_median_simulated_ms,latency_p99_live_ms,latency_p99_simulated_ms");
     for (const Point& p : checks) {
