@@ -30,13 +30,13 @@ TEST(PluginSymbols, ExportsExactlyTheExternalInterfaceAndFindsThePlatformBesideI
     // The toolchain's own symbols, and the address checker's markers beside exported globals.
     const std::set<std::string> toolchain = {"_init", "_fini", "_edata", "_end", "__bss_start"};
     std::set<std::string> actual;
-    std::istringstream lines(run("nm -D --defined-only --format=posix '" KORVO_PLUGIN_PATH "'"));
+    std::istringstream lines(run(KORVO_NM " -D --defined-only --format=posix '" KORVO_PLUGIN_PATH "'"));
     for (std::string line; std::getline(lines, line);) {
         const std::string name = line.substr(0, line.find(' '));
         if (!toolchain.count(name) && name.rfind("__odr_asan.", 0) != 0) actual.insert(name);
     }
     EXPECT_EQ(actual, expected);
-    const std::string dynamic = run("readelf -d '" KORVO_PLUGIN_PATH "'");
+    const std::string dynamic = run(KORVO_READELF " -d '" KORVO_PLUGIN_PATH "'");
     EXPECT_NE(dynamic.find("(RUNPATH)"), std::string::npos) << dynamic;
     EXPECT_NE(dynamic.find("[$ORIGIN]"), std::string::npos) << dynamic;
     EXPECT_NE(dynamic.find("libkorvo_platform.so"), std::string::npos) << dynamic;
@@ -44,7 +44,7 @@ TEST(PluginSymbols, ExportsExactlyTheExternalInterfaceAndFindsThePlatformBesideI
 
 TEST(PluginSymbols, TheToneTableIsExportedAs512RecordsOf216Bytes) {
     // A host reads the table through the symbol: its size is the layout hosts rely on.
-    std::istringstream lines(run("nm -D -S --defined-only --format=posix '" KORVO_PLUGIN_PATH "'"));
+    std::istringstream lines(run(KORVO_NM " -D -S --defined-only --format=posix '" KORVO_PLUGIN_PATH "'"));
     std::string size;
     for (std::string line; std::getline(lines, line);) {
         std::istringstream fields(line);

@@ -493,11 +493,14 @@ TEST_F(Tone, ThePlaybackThreadIntoAFile) {
     Samples want = ref.block(882, START);
     for (int b = 0; b < 9; ++b) want = want + ref.block(882, CONT);
     want = want + ref.block(882, STOP);
-    ASSERT_GE(s.size(), want.size());
-    EXPECT_TRUE(std::equal(want.begin(), want.end(), s.begin()));
-    size_t silent = want.size();
+    // The route writes silence until the track's first block is due: a start that came late
+    // (a loaded or emulated machine) begins the file with it.
+    const size_t start = static_cast<size_t>(std::find_if(s.begin(), s.end(), [](short v) { return v != 0; }) - s.begin());
+    ASSERT_GE(s.size(), start + want.size());
+    EXPECT_TRUE(std::equal(want.begin(), want.end(), s.begin() + static_cast<long>(start)));
+    size_t silent = start + want.size();
     while (silent < s.size() && s[silent] == 0) ++silent;
-    EXPECT_GT(silent, want.size());
+    EXPECT_GT(silent, start + want.size());
 }
 
 }  // namespace

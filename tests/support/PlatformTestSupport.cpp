@@ -29,12 +29,20 @@ std::vector<int16_t> readWav(const std::string& path, int* rate) {
     return samples;
 }
 
+std::string emulator() { return KORVO_TEST_EMULATOR; }
+
 Child::Child(const host::EnvList& env, bool captureStderr) {
     std::string error;
     host::ChildProcess::Options options;
     options.captureStderr = captureStderr;
     options.nullStdin = true;
-    EXPECT_TRUE(start(host::selfExecutable(), {"child"}, env, options, &error)) << error;
+    const std::string through = emulator();
+    if (through.empty()) {
+        EXPECT_TRUE(start(host::selfExecutable(), {"child"}, env, options, &error)) << error;
+    } else {
+        // qemu-user's -0 sets the program's argv[0].
+        EXPECT_TRUE(start(through, {through, "-0", "child", host::selfExecutable()}, env, options, &error)) << error;
+    }
 }
 
 bool Child::waitReady(int timeoutMs) {

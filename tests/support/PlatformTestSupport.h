@@ -26,6 +26,9 @@ std::string readFile(const std::string& path);
 // A 16-bit mono WAV file's samples as an independent reader sees them (empty when unreadable).
 std::vector<int16_t> readWav(const std::string& path, int* rate);
 
+// The emulator a cross build's tests run under; empty on the build machine's own processor.
+std::string emulator();
+
 // This test binary run again with `env` changed (an empty value removes a variable); it
 // takes its role from a static initialiser and exits before any test runs.
 class Child : public host::ChildProcess {

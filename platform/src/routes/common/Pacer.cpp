@@ -1,5 +1,6 @@
 // Real-time timeline of a route.
 #include "routes/common/Pacer.h"
+#include "routes/common/SampleClock.h"
 
 #include <ctime>
 
@@ -56,8 +57,7 @@ bool Pacer::stopped() const {
 
 uint64_t Pacer::positionLocked(int64_t nowNs) const {
     if (mRate == 0 || nowNs <= mAnchorNs) return 0;
-    const unsigned __int128 elapsed = static_cast<unsigned __int128>(nowNs - mAnchorNs);
-    return static_cast<uint64_t>(elapsed * mRate / kNsPerSec);
+    return samplesIn(static_cast<uint64_t>(nowNs - mAnchorNs), mRate);
 }
 
 uint64_t Pacer::position() const {
@@ -78,9 +78,7 @@ uint64_t Pacer::waitUntil(uint64_t pos) {
             break;
         }
         // Deadline of `pos`, rounded up so that the wait never ends before its position.
-        const unsigned __int128 offset =
-            (static_cast<unsigned __int128>(pos) * kNsPerSec + mRate - 1) / mRate;
-        const int64_t deadline = mAnchorNs + static_cast<int64_t>(offset);
+        const int64_t deadline = mAnchorNs + static_cast<int64_t>(nanosecondsOf(pos, mRate));
         timespec ts{};
         ts.tv_sec = static_cast<time_t>(deadline / kNsPerSec);
         ts.tv_nsec = static_cast<long>(deadline % kNsPerSec);

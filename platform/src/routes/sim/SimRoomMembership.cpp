@@ -161,7 +161,10 @@ void setUp(RoomLayout& layout) {
 uint64_t processIdentity(int pid) {
     if (pid <= 0) return 0;
     char path[64];
-    std::snprintf(path, sizeof path, "/proc/%d/stat", pid);
+    // The main thread's record: the process's own, and one that a user-mode emulator passes
+    // through as the kernel wrote it (it makes up /proc/PID/stat for the process it runs, so
+    // a process would not know itself as others see it).
+    std::snprintf(path, sizeof path, "/proc/%d/task/%d/stat", pid, pid);
     const int fd = open(path, O_RDONLY | O_CLOEXEC);
     if (fd < 0) {
         // Without /proc, fall back to the pid alone.

@@ -15,6 +15,7 @@
 #include <utils/Errors.h>
 
 #include "routes/common/Pacer.h"
+#include "routes/common/SampleClock.h"
 #include "routes/wav/WavRoutes.h"
 #include "routes/wav/SoundFileInput.h"
 
@@ -104,8 +105,7 @@ private:
 
     // Samples the loudspeaker has played since the first open, by the clock.
     uint64_t clockPosition() const {
-        const auto elapsed = static_cast<unsigned __int128>(std::max<int64_t>(monotonicNs() - mOpenedNs, 0));
-        return static_cast<uint64_t>(elapsed * mRate / 1000000000U);
+        return samplesIn(static_cast<uint64_t>(std::max<int64_t>(monotonicNs() - mOpenedNs, 0)), mRate);
     }
 
     // Silence up to `position`. A writer keeping the pace is one buffer ahead of the clock;
