@@ -1,16 +1,5 @@
-# Cross build for arm-linux-gnueabihf with Debian's cross compiler and the multiarch -dev packages
-# (libraries in /usr/lib/arm-linux-gnueabihf, headers in /usr/include); the tests run under
-# qemu-user, which finds the target's loader and libraries at their multiarch places.
-set(CMAKE_SYSTEM_NAME Linux)
+# armhf: 32-bit ARM (ARMv7 with hardware floating point), where long and pointers have 32 bits.
+set(KORVO_CROSS_TRIPLET arm-linux-gnueabihf)
 set(CMAKE_SYSTEM_PROCESSOR arm)
-set(CMAKE_C_COMPILER arm-linux-gnueabihf-gcc)
-set(CMAKE_CXX_COMPILER arm-linux-gnueabihf-g++)
-set(CMAKE_LIBRARY_ARCHITECTURE arm-linux-gnueabihf)
-set(CMAKE_CROSSCOMPILING_EMULATOR qemu-arm)
-# pkg-config reads only the target's .pc files (and the architecture-free ones).
-set(ENV{PKG_CONFIG_LIBDIR} /usr/lib/arm-linux-gnueabihf/pkgconfig:/usr/share/pkgconfig)
-set(ENV{PKG_CONFIG_PATH} "")
-# Programs come from the build machine; libraries, headers and packages only from the target's
-# multiarch places (or architecture-free ones): never the build machine's own libraries.
-set(CMAKE_FIND_ROOT_PATH_MODE_PROGRAM NEVER)
-set(CMAKE_IGNORE_PATH /usr/lib/x86_64-linux-gnu /lib/x86_64-linux-gnu)
+set(KORVO_CROSS_EMULATOR qemu-arm)
+include(${CMAKE_CURRENT_LIST_DIR}/debian-cross.cmake)
