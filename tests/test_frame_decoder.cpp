@@ -162,6 +162,24 @@ TEST_F(FrameDecoderTest, InALongReverberationWithoutNoiseACodeSaidAgainIsHeardAg
     EXPECT_NEAR(events[1].frame - events[0].frame, 43, 2) << "half a second apart";
 }
 
+TEST_F(FrameDecoderTest, ALoudspeakersHarmonicIsNotACodeWhenItsFundamentalBeatsWithItsEchoes) {
+    // Code 0 with its 2nd harmonic (code 3's frequency) 30 dB down, as a cheap loudspeaker
+    // plays it; the room's echoes beat with it, and for one frame they all but cancel the
+    // fundamental at the microphone (40 dB down) while the harmonic, beating on its own,
+    // stands as it was.
+    const double f0 = korvo::codeHz(0), second = 0.3 * std::pow(10.0, -30.0 / 20.0);
+    const int start = 20 * kFrame, dip = start + 5 * kFrame, end = start + 12 * kFrame;
+    Samples s(static_cast<size_t>(end + korvo::kSampleRate / 2), 0);
+    for (int i = start; i < end; ++i) {
+        const double t = static_cast<double>(i - start) / korvo::kSampleRate;
+        const double a = i >= dip && i < dip + kFrame ? 0.003 : 0.3;
+        s[static_cast<size_t>(i)] = static_cast<int16_t>(std::lrint(32767.0 * (a * std::sin(2 * M_PI * f0 * t) + second * std::cos(4 * M_PI * f0 * t))));
+    }
+    const auto events = decode(s);
+    ASSERT_EQ(events.size(), 1u) << codes(events);
+    EXPECT_EQ(events[0].code, 0);
+}
+
 TEST_F(FrameDecoderTest, ThresholdsFollowTheNoiseModel) {
     // In noise alone a bin's power and each reference bin's are exponential; the noise
     // estimate is the rank-th smallest of `count` references. The chance that a bin passes

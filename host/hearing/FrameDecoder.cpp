@@ -74,6 +74,7 @@ void FrameDecoder::reset() {
     for (Track& t : mTracks) t = Track{};
     for (auto& a : mLastHz) a.fill(-1.0);
     mSounding = 0;
+    for (auto& w : mWindows) w->clear();
 }
 
 void FrameDecoder::levels(float* out256) const {
@@ -122,17 +123,25 @@ bool FrameDecoder::harmonicOfStronger(const SpectrumWindow& w, const Peak& p) co
                 if (f0 < kLowestFundamentalHz || f0 > nyquist - 2.0 * w.binHz()) continue;
                 if (std::fabs(f0 - p.hz) < 2.0 * w.binHz()) continue;
                 const int centre = static_cast<int>(std::lround(f0 / w.binHz()));
+                if (k <= kLooseHarmonic) {
+                    // The line as it has stood over its last dips: a loudspeaker's tone
+                    // beating with its echoes dips for a frame where its harmonic does not.
+                    int h = centre - 1;
+                    for (int c = centre; c <= centre + 1; ++c) {
+                        if (w.heldPower(c) > w.heldPower(h)) h = c;
+                    }
+                    if (w.heldPower(h) >= w.power(p.bin) && w.heldPower(h) >= mLineFactor * w.noise(h, kGap)) return true;
+                    continue;
+                }
                 const int b = w.peak(centre - 1, centre + 1);
                 if (b < 0 || w.power(b) < w.power(p.bin)) continue;
                 // Beyond the first harmonics a bin's width at f0 covers many multiples: the
                 // line's own frequency, times k, must land on the peak, within the
                 // interpolation's error (a few Hz) k times.
-                if (k > kLooseHarmonic) {
-                    double hz = 0.0, power = 0.0;
-                    w.interpolate(b, &hz, &power);
-                    const double folded = std::fabs(std::remainder(k * hz, kRate));
-                    if (std::fabs(folded - p.hz) > std::max(0.15 * w.binHz(), 3.0) * (k + 1)) continue;
-                }
+                double hz = 0.0, power = 0.0;
+                w.interpolate(b, &hz, &power);
+                const double folded = std::fabs(std::remainder(k * hz, kRate));
+                if (std::fabs(folded - p.hz) > std::max(0.15 * w.binHz(), 3.0) * (k + 1)) continue;
                 if (w.power(b) >= mLineFactor * w.noise(b, kGap)) return true;
             }
         }

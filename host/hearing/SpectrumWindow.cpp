@@ -23,7 +23,8 @@ std::once_flag gPlannerSafe;
 
 SpectrumWindow::SpectrumWindow(int length, int referenceCount)
     : mLength(length), mCount(std::min(referenceCount, kMaxReferenceCount)), mBinHz(static_cast<double>(korvo::kSampleRate) / length),
-      mWindow(static_cast<size_t>(length)), mPower(static_cast<size_t>(length / 2 + 1), 0.0f) {
+      mWindow(static_cast<size_t>(length)), mPower(static_cast<size_t>(length / 2 + 1), 0.0f),
+      mHeld(static_cast<size_t>(length / 2 + 1), 0.0f) {
     // A Hann window's coherent gain is 1/2: a sine of amplitude A reads |X| = A N / 4.
     const double scale = 4.0 / length;
     for (int i = 0; i < length; ++i)
@@ -47,7 +48,16 @@ void SpectrumWindow::analyse(const float* samples) {
     for (int i = 0; i < mLength; ++i) mIn[i] = samples[i] * mWindow[static_cast<size_t>(i)];
     fftwf_execute(static_cast<fftwf_plan>(mPlan));
     const auto* out = static_cast<const fftwf_complex*>(mOut);
-    for (int b = 0; b < bins(); ++b) mPower[static_cast<size_t>(b)] = out[b][0] * out[b][0] + out[b][1] * out[b][1];
+    for (int b = 0; b < bins(); ++b) {
+        const float p = out[b][0] * out[b][0] + out[b][1] * out[b][1];
+        mPower[static_cast<size_t>(b)] = p;
+        mHeld[static_cast<size_t>(b)] = std::max(p, kHeldDecay * mHeld[static_cast<size_t>(b)]);
+    }
+}
+
+void SpectrumWindow::clear() {
+    std::fill(mPower.begin(), mPower.end(), 0.0f);
+    std::fill(mHeld.begin(), mHeld.end(), 0.0f);
 }
 
 bool SpectrumWindow::referenceBelow(int bin, int gap) const {

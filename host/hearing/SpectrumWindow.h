@@ -35,6 +35,14 @@ public:
     int bins() const { return mLength / 2 + 1; }
     double binHz() const { return mBinHz; }
     float power(int bin) const { return mPower[static_cast<size_t>(bin)]; }
+    // The bin's power as it has stood over its last dips: the greatest of its powers in the
+    // analyses so far, each kHeldDecay lower for every analysis since. A tone heard with its
+    // echoes beats: for a frame its echoes may cancel it at the microphone, not its
+    // harmonics at the same moment.
+    static constexpr float kHeldDecay = 0.5f;  // 3 dB an analysis
+    float heldPower(int bin) const { return mHeld[static_cast<size_t>(bin)]; }
+    // Forgets every power so far (the held ones).
+    void clear();
 
     // The quietest noise a room can have: white noise of 2 LSB RMS at 16 bits (-84 dBFS). A
     // microphone's own noise lies above it; below it lie only a converter's silence and
@@ -72,6 +80,7 @@ private:
     void* mPlan = nullptr;
     std::vector<float> mWindow;
     std::vector<float> mPower;
+    std::vector<float> mHeld;
 };
 
 }  // namespace host
