@@ -180,6 +180,30 @@ TEST_F(FrameDecoderTest, ALoudspeakersHarmonicIsNotACodeWhenItsFundamentalBeatsW
     EXPECT_EQ(events[0].code, 0);
 }
 
+TEST_F(FrameDecoderTest, AnEchoBurstLongAfterACodeIsNotTheCodeAgainButTheCodeSaidAgainIs) {
+    // Code 5 for 300 ms; 1.2 s later its echo comes back as a burst 45 dB under it (as sox's
+    // reverberation sends it), then at 2.4 s the code is said again at its first level.
+    const double hz = korvo::codeHz(5);
+    const int second = korvo::kSampleRate;
+    Samples s(static_cast<size_t>(3 * second), 0);
+    std::mt19937_64 rng(11);
+    std::normal_distribution<double> noise(0.0, 3e-5);
+    const auto add = [&](int from, int count, double amplitude) {
+        for (int i = 0; i < count; ++i) {
+            const double t = static_cast<double>(i) / korvo::kSampleRate;
+            s[static_cast<size_t>(from + i)] = static_cast<int16_t>(std::lrint(32767.0 * amplitude * std::sin(2 * M_PI * hz * t)));
+        }
+    };
+    add(second / 4, 3 * second / 10, 0.3);
+    add(second / 4 + 3 * second / 10 + 6 * second / 5, second / 10, 0.3 * std::pow(10.0, -45.0 / 20.0));
+    add(12 * second / 5, 3 * second / 10, 0.3);
+    for (int16_t& v : s) v = static_cast<int16_t>(v + std::lrint(32767.0 * noise(rng)));
+    const auto events = decode(s);
+    ASSERT_EQ(events.size(), 2u) << codes(events);
+    EXPECT_EQ(events[1].code, 5);
+    EXPECT_GT(events[1].frame, 2 * 86 + 8) << "the code said again, not its echo";
+}
+
 TEST_F(FrameDecoderTest, ThresholdsFollowTheNoiseModel) {
     // In noise alone a bin's power and each reference bin's are exponential; the noise
     // estimate is the rank-th smallest of `count` references. The chance that a bin passes

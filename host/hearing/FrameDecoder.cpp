@@ -186,7 +186,9 @@ bool FrameDecoder::pureLine(int window, const SpectrumWindow& w, const Peak& p) 
 
 double FrameDecoder::returnLevel(const Track& t) {
     const double seconds = static_cast<double>(t.sinceEnd * korvo::kFrameSamples) / kRate;
-    return kReturnFactor * t.endLevel * std::pow(10.0, -6.0 * seconds / kMaxReverbSeconds);
+    const double fromEnd = kReturnFactor * t.endLevel * std::pow(10.0, -6.0 * seconds / kMaxReverbSeconds);
+    const double fromPeak = kReturnPeakFactor * t.peakLevel * std::pow(10.0, -kReturnPeakDbPerSecond * seconds / 10.0);
+    return std::max(fromEnd, fromPeak);
 }
 
 bool FrameDecoder::begins(int code, Track& t) {

@@ -81,6 +81,12 @@ public:
     // must stand kReturnFactor above where such a fade would have left the ended sounding.
     static constexpr double kMaxReverbSeconds = 3.0;
     static constexpr double kReturnFactor = 10.0;  // 10 dB in power: an echo regrows after its dips by less
+    // Nor may a return lie more than 20 dB under the code's last peak, a bound that eases by
+    // 10 dB a second: some rooms (and sox's reverberation) send a tone back in bursts that
+    // regrow by 18 dB more than a second after it ended, 45 dB under the tone, where the same
+    // code said again by the same sender arrives at about its first level.
+    static constexpr double kReturnPeakFactor = 0.01;
+    static constexpr double kReturnPeakDbPerSecond = 10.0;
     // Where the noise floor is far down (a hall without noise) a code's reverberant tail
     // stays above the hold threshold for seconds, and the same code said again meanwhile
     // would never be reported. A sounding whose line has stayed kFallFactor below its peak for
