@@ -1,7 +1,7 @@
 #!/usr/bin/env bash
 # Measures the operating envelope of the link and writes its CSV files and plots into
 # docs/envelope (about 40 minutes on two cores). Arguments go to korvo_envelope
-# (--trials N, --quick, --no-realtime, --realtime-only).
+# (--trials N, --quick, --no-realtime, --realtime-only, --rooms: the room and device presets).
 set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/install-deps.sh envelope

@@ -7,13 +7,12 @@ set multiplot layout 2,3 title "A code heard by the frame decoder in each room a
 set yrange [0:1.05]
 set xrange [-0.5:22.5]
 set xlabel "code"
-set ylabel "probability heard"
 set key bottom left
 set grid
 rooms = "quiet office kitchen hall street"
 devices = "ideal phone laptop cheap-speaker"
 do for [r in rooms] {
-    set title r
+    set ylabel sprintf("%s: probability heard", r)
     plot for [d in devices] dir."/rooms-codes.csv" using ((strcol(1) eq r && strcol(2) eq d) ? $3 : NaN):8 with linespoints title d
 }
 unset multiplot
