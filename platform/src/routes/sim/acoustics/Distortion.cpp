@@ -84,6 +84,7 @@ Distortion::Distortion(double secondDb, double thirdDb) {
     const double r2 = amplitudeOf(secondDb), r3 = amplitudeOf(thirdDb);
     mA3 = 4.0 * r3 / (1.0 - 3.0 * r3);
     mA2 = 2.0 * r2 * (1.0 + 0.75 * mA3);
+    phases();  // the filters are made here, not on the first sound played
 }
 
 void Distortion::push(float shaped) {
