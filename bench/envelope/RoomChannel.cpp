@@ -9,7 +9,6 @@ namespace envelope {
 namespace {
 
 constexpr double kRate = 44100.0;
-constexpr double kSpeedOfSound = 343.0;
 constexpr int kChunk = 512;
 
 }  // namespace
@@ -19,9 +18,9 @@ RoomChannel::RoomChannel(const acoustics::RoomPreset& room, const acoustics::Dev
     : mSpeaker(std::move(speaker)),
       mDistortion(device.secondDb, device.thirdDb),
       mSpeakerResponse(device.speaker, kRate),
-      mQueued(static_cast<size_t>(std::lround(room.distanceM / kSpeedOfSound * kRate)), 0.0f),
+      // The path's delay: the speaker's sound is queued that many samples behind silence.
+      mQueued(static_cast<size_t>(std::lround(room.distanceM / acoustics::kSpeedOfSound * kRate)), 0.0f),
       mGain(static_cast<float>(1.0 / room.distanceM)),
-      mDelay(std::lround(room.distanceM / kSpeedOfSound * kRate)),
       mReverb(room.decaySeconds, room.criticalDistanceM, seed * 7919 + 3, kRate),
       mMicResponse(device.microphone, kRate),
       mRoom(kChunk),

@@ -34,8 +34,6 @@ public:
                                              uint64_t seed, Speaker speaker, std::string* error);
     // The microphone's next `count` samples, 16-bit.
     void capture(int16_t* out, int count);
-    // The path's delay, in the room's samples.
-    int64_t delaySamples() const { return mDelay; }
 
 private:
     RoomChannel(const acoustics::RoomPreset& room, const acoustics::DevicePreset& device, uint64_t seed, Speaker speaker);
@@ -50,7 +48,6 @@ private:
     std::unique_ptr<acoustics::ClockDrift> mSpeakerClock;
     std::deque<float> mQueued;  // the speaker's room samples, the path's delay ahead
     float mGain;
-    int64_t mDelay;
     acoustics::RoomReverb mReverb;
     std::unique_ptr<acoustics::Background> mBackground;
     acoustics::Response mMicResponse;

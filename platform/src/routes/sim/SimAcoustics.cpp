@@ -11,7 +11,6 @@ namespace sim {
 
 namespace {
 
-constexpr double kSpeedOfSound = 343.0;  // m/s in air at 20 degrees C
 constexpr float kFullScale = 32768.0f;
 
 }  // namespace
@@ -41,8 +40,8 @@ RoomHearing::RoomHearing(const AcousticSettings& settings, uint64_t seed, uint64
     : mOwn(ownIdentity),
       mPeerGain(static_cast<float>(1.0 / settings.distanceM)),
       mSelfGain(settings.device->selfDistanceM > 0.0 ? static_cast<float>(1.0 / settings.device->selfDistanceM) : mPeerGain),
-      mPeerDelay(std::lround(settings.distanceM / kSpeedOfSound * kRoomRate)),
-      mSelfDelay(settings.device->selfDistanceM > 0.0 ? std::lround(settings.device->selfDistanceM / kSpeedOfSound * kRoomRate)
+      mPeerDelay(std::lround(settings.distanceM / acoustics::kSpeedOfSound * kRoomRate)),
+      mSelfDelay(settings.device->selfDistanceM > 0.0 ? std::lround(settings.device->selfDistanceM / acoustics::kSpeedOfSound * kRoomRate)
                                                        : mPeerDelay),
       mReverb(settings.room->decaySeconds, settings.room->criticalDistanceM, seed * 7919 + 3, kRoomRate),
       mResponse(settings.device->microphone, kRoomRate) {}

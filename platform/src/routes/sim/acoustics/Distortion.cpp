@@ -1,5 +1,6 @@
 #include "routes/sim/acoustics/Distortion.h"
 
+#include <algorithm>
 #include <cmath>
 
 namespace korvo {
@@ -109,8 +110,9 @@ void Distortion::process(float* samples, int count) {
     if (none()) return;
     for (int i = 0; i < count; ++i) {
         const float x = samples[i];
-        mZeros = x == 0.0f ? mZeros + 1 : 0;
-        // Both histories hold only zeros: the output is silence (the curve keeps zero at zero).
+        // Once both histories hold only zeros the output is silence (the curve keeps zero at
+        // zero); the count stops there, so hours of silence cannot overflow it.
+        mZeros = x != 0.0f ? 0 : std::min(mZeros + 1, kUp + kRing + 1);
         samples[i] = mZeros > kUp + kRing ? 0.0f : step(x);
     }
 }

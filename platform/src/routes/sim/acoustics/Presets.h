@@ -26,6 +26,9 @@ struct DevicePreset {
     const char* why;
 };
 
+// A path of d metres delays its sound by d / kSpeedOfSound seconds.
+constexpr double kSpeedOfSound = 343.0;  // m/s in air at 20 degrees C
+
 struct RoomPreset {
     const char* name;
     double decaySeconds;       // T60; 0: no reverberation (outdoors, or today's ideal room)
